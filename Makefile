@@ -1,0 +1,37 @@
+# Front door: every target sets itself up, so each works on a fresh machine.
+JOBS ?= 2
+CMAKE_FLAGS ?=
+
+.PHONY: all deps build test asan tsan demo bench clean
+
+all: build
+
+deps:
+	@tools/install-deps.sh
+
+# Phony on purpose: always reconfigure and rebuild into build/.
+build: deps
+	cmake -S . -B build $(CMAKE_FLAGS)
+	cmake --build build -j $(JOBS)
+
+test: build
+	ctest --test-dir build --output-on-failure -j $(JOBS)
+
+asan: deps
+	cmake -S . -B build-asan -DHOSTCALL_SANITIZE=address,undefined $(CMAKE_FLAGS)
+	cmake --build build-asan -j $(JOBS)
+	ASAN_OPTIONS=detect_leaks=1 UBSAN_OPTIONS=print_stacktrace=1:halt_on_error=1 \
+	  ctest --test-dir build-asan --output-on-failure -j $(JOBS)
+
+# The C++ suite under ThreadSanitizer (the JVM cannot host it).
+tsan: deps
+	cmake -S . -B build-tsan -DHOSTCALL_SANITIZE=thread $(CMAKE_FLAGS)
+	cmake --build build-tsan -j $(JOBS)
+	TSAN_OPTIONS=halt_on_error=1:second_deadlock_stack=1 \
+	  ctest --test-dir build-tsan --output-on-failure -j $(JOBS) -L cxx
+
+demo: build
+	@echo "The demo arrives with the service bridge."
+
+clean:
+	rm -rf build build-asan build-tsan
