@@ -1,1 +1,81 @@
-// placeholder
+#include "xpl/Xlog.h"
+
+#include <android/log.h>
+
+#include <cstdarg>
+#include <cstdio>
+#include <new>
+
+#include "xpl/XlogInternal.h"
+
+namespace {
+
+// Android priorities by level; levels past the table (and negative ones) log
+// as verbose.
+constexpr int kPriorityByLevel[] = {
+    ANDROID_LOG_ERROR,  // E
+    ANDROID_LOG_WARN,   // W
+    ANDROID_LOG_INFO,   // I
+    ANDROID_LOG_DEBUG,  // D
+};
+static_assert(sizeof(kPriorityByLevel) / sizeof(kPriorityByLevel[0]) == XLOG_LEVEL_V,
+              "every level below V has its own priority");
+
+int priorityOf(int level) {
+    return level >= 0 && level < XLOG_LEVEL_V ? kPriorityByLevel[level] : ANDROID_LOG_VERBOSE;
+}
+
+bool isModule(int module) { return module >= 0 && module < XLOG_NUM_MODULES; }
+
+XlogState* createState() {
+    // Value-initialised: empty strings, null tags, every level 0 (only E
+    // passes), all flags false. Never freed, so that threads still logging
+    // while the process exits find it intact.
+    XlogState* state = new XlogState();
+    state->logger.shouldLog = xlogShouldLog;
+    state->logger.print = xlogPrint;
+    return state;
+}
+
+// Opened on the first print, exactly once even when threads race to it, and
+// never closed: a late line from another thread during exit stays safe.
+FILE* kmsgStream() {
+    static FILE* const stream = std::fopen("/dev/kmsg", "w+");
+    return stream;
+}
+
+}  // namespace
+
+XlogState* xlogState() {
+    static XlogState* const state = createState();
+    return state;
+}
+
+// Forced at load as well, so that g_xlog points at the record from then on.
+XlogState* g_xlog = xlogState();
+
+XlogLogger* xlogGetLogger() { return &xlogState()->logger; }
+
+int xlogShouldLog(int module, int level) {
+    // A module outside the table is a caller's mistake; answer no rather than
+    // read past the table.
+    return isModule(module) && xlogState()->modules[module].level >= level ? 1 : 0;
+}
+
+void xlogPrint(int level, int module, const char* /*file*/, const char* /*function*/, int /*line*/,
+               const char* format, ...) {
+    va_list args;
+    va_start(args, format);
+    if (FILE* kmsg = kmsgStream()) {
+        // One message, two sinks: the kernel log consumes a copy so that the
+        // Android log still receives the untouched argument list.
+        va_list kmsgArgs;
+        va_copy(kmsgArgs, args);
+        std::vfprintf(kmsg, format, kmsgArgs);
+        va_end(kmsgArgs);
+        std::fflush(kmsg);
+    }
+    const char* tag = isModule(module) ? xlogState()->modules[module].tag : nullptr;
+    __android_log_vprint(priorityOf(level), tag, format, args);
+    va_end(args);
+}
