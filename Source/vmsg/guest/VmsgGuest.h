@@ -1,0 +1,45 @@
+// The guest client of the paravirtual message device: one connection to one
+// host service, with a host-bound and a guest-bound buffer shared through one
+// mapping of the device.
+#pragma once
+
+#include <cstdint>
+#include <string>
+
+#include "vmsg/guest/VmsgDevice.h"
+#include "xpl/XplExport.h"
+
+// Not thread-safe: an exchange (getHostBoundBuffer, writing the request,
+// processRequest, reading the reply) owns both buffers until the reply has been
+// read, so callers on several threads serialise whole exchanges themselves.
+//
+// The field layout is part of the exported interface; keep it.
+class XPL_EXPORT VmsgGuestClient {
+  public:
+    VmsgGuestClient() = default;
+    VmsgGuestClient(const VmsgGuestClient&) = delete;
+    VmsgGuestClient& operator=(const VmsgGuestClient&) = delete;
+
+    // Opens the device, connects to `id` and maps the shared buffers. Expects
+    // a client that is not connected.
+    bool connect(VmsgServiceId id);
+    // Releases the mapping and the descriptor; the record keeps its sizes,
+    // pointers and name. Does nothing more on a client that is not connected.
+    void disconnect();
+    // The host-bound buffer for a request of `len` bytes, or null when `len`
+    // exceeds the capacity or the client is not connected.
+    void* getHostBoundBuffer(uint32_t len);
+    // Hands the request at the start of the host-bound buffer to the host and
+    // waits for the reply; returns the guest-bound buffer, or null when refused
+    // or failed.
+    void* processRequest(void* request, uint32_t len);
+
+    int32_t mFd = -1;
+    uint32_t mMaxHostBoundSize = 0;
+    uint32_t mMaxGuestBoundSize = 0;
+    uint32_t mSpare = 0;
+    uint32_t mGuestBoundOffset = 0;
+    void* mHostBoundBuf = nullptr;
+    void* mGuestBoundBuf = nullptr;
+    std::string mServiceName;
+};
