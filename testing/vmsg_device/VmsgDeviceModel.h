@@ -1,0 +1,128 @@
+// A stand-in for the paravirtual message device "/dev/kivvmsg" and the host
+// behind it, for the process it lives in.
+//
+// Linked into a test program (target vmsg_device_objects) or preloaded
+// (libvmsg_device.so), it interposes open/openat, ioctl and close: opening the
+// device path yields a memfd, so the client's mmap and munmap are the real
+// calls on real shared memory, and the three device requests on that
+// descriptor are served by an in-process host that speaks the host-call
+// service "hcal". Every other path and descriptor passes through untouched.
+//
+// Tests drive it through the functions below; a preloaded copy reads the same
+// settings from VMSG_DEVICE_* environment variables (see VmsgDeviceEnv.cpp).
+// All functions are thread-safe.
+#pragma once
+
+#include <array>
+#include <cstdint>
+#include <functional>
+#include <map>
+#include <string>
+#include <vector>
+
+#define VMSG_DEVICE_API __attribute__((visibility("default")))
+
+// How the host writes a reply into the guest-bound buffer.
+enum class VmsgDeviceReplyMode {
+    Scripted,  // the proper reply: filled data, then the 4-byte result
+    Short,     // only the first shortReplyBytes bytes of the proper reply
+    Garbage,   // the whole guest-bound buffer filled with a pseudo-random pattern
+    Raw,       // exactly rawReply, whatever the operation
+};
+
+// What the device and the host answer. Settings that describe the connection
+// (capacities, offset, spare word, the mmap fault) take effect at the next
+// CONNECT; the others at the next request.
+struct VmsgDeviceScript {
+    // Out-words of CONNECT. guestBoundOffset 0 means "right after the
+    // host-bound buffer, rounded up to a page". The memfd is sized to
+    // guestBoundOffset + guestBoundCapacity, computed without wrapping.
+    uint32_t hostBoundCapacity = 65536;
+    uint32_t guestBoundCapacity = 65536;
+    uint32_t spare = 0;
+    uint32_t guestBoundOffset = 0;
+
+    // Faults, each an errno value; 0 means no fault. The device refuses
+    // service ids other than "hcal" with ECONNREFUSED whatever is set here.
+    int openErrno = 0;     // open("/dev/kivvmsg") fails
+    int connectErrno = 0;  // VMSG_IOC_CONNECT fails
+    int sendErrno = 0;     // VMSG_IOC_SEND_RECEIVE fails (the request is still recorded)
+    // The memfd is sealed against writable shared mappings after CONNECT, so
+    // the client's mmap fails for real (EPERM).
+    bool mmapFails = false;
+
+    // Answers. results maps an operation code to its 4-byte result; codes not
+    // listed answer defaultResult. Operation 24 answers results[24] when it is
+    // listed, else launchAllowed as a bool field (1 or 0).
+    std::map<uint32_t, int32_t> results;
+    int32_t defaultResult = 0;
+    bool launchAllowed = true;
+    // A malformed request is answered with this result in the first 4 bytes.
+    int32_t malformedResult = -22;
+
+    // Filled data. Buffers get the bytes of the text, NUL-padded (or cut, and
+    // then unterminated) to the capacity the request named.
+    std::string propsText;   // operation 1, the char * buffer
+    int32_t propsValue = 0;  // operation 1, the i32 *
+    uint64_t timeValue = 0;  // operation 5, the u64 *
+    std::string timeText;    // operation 5, the char * buffer
+
+    // Pause inside SEND_RECEIVE before the reply is written.
+    uint32_t delayUs = 0;
+
+    VmsgDeviceReplyMode replyMode = VmsgDeviceReplyMode::Scripted;
+    uint32_t shortReplyBytes = 0;
+    std::vector<uint8_t> rawReply;
+
+    // Each exchange is also appended, one line, to this file (empty: none) and,
+    // when printCalls is set, its decoded call is written to standard error.
+    std::string tracePath;
+    bool printCalls = false;
+};
+
+// One SEND_RECEIVE as the host saw it.
+struct VmsgDeviceExchange {
+    uint32_t opCode = 0;           // first word of the request (0 if unreadable)
+    std::vector<uint8_t> request;  // raw request bytes: totalLength of them, cut to the capacity
+    std::string text;              // decoded call, e.g. hcallOnLocaleChangedRpc("en-US") -> 0
+    bool wellFormed = false;       // the framing matched the catalogue exactly
+    std::string problem;           // why not, when not
+    std::vector<uint8_t> reply;    // bytes the host wrote into the guest-bound buffer
+    int sendErrno = 0;             // nonzero: the request was failed with this errno
+    bool overlapped = false;  // another exchange was in flight, or the request changed under it
+};
+
+enum class VmsgDeviceEventKind { Open, Connect, Disconnect, SendReceive, OtherIoctl, Close };
+
+// One call that reached the device, in order.
+struct VmsgDeviceEvent {
+    VmsgDeviceEventKind kind = VmsgDeviceEventKind::Open;
+    int fd = -1;                           // descriptor (for a failed open, -1)
+    int openFlags = 0;                     // Open: the flags passed
+    unsigned long request = 0;             // ioctl request number
+    std::array<uint8_t, 20> connectIn{};   // Connect: the argument as the client passed it
+    std::array<uint8_t, 20> connectOut{};  // Connect: the argument as the device left it
+    int result = 0;                        // what the call returned
+    int error = 0;                         // errno when result is negative
+};
+
+// Replaces the script (and applies its trace and print settings).
+VMSG_DEVICE_API void vmsgDeviceConfigure(const VmsgDeviceScript& script);
+// The script in force.
+VMSG_DEVICE_API VmsgDeviceScript vmsgDeviceScript();
+// Default script, and forgets exchanges, events and overlaps. Open device
+// descriptors and their connections stay as they are.
+VMSG_DEVICE_API void vmsgDeviceReset();
+
+VMSG_DEVICE_API std::vector<VmsgDeviceExchange> vmsgDeviceExchanges();
+VMSG_DEVICE_API std::vector<VmsgDeviceEvent> vmsgDeviceEvents();
+// Exchanges that began while another was in flight or whose request bytes
+// changed while the host was serving them. Tests expect 0.
+VMSG_DEVICE_API size_t vmsgDeviceOverlapCount();
+// Device descriptors currently open.
+VMSG_DEVICE_API size_t vmsgDeviceOpenCount();
+
+// Called inside every SEND_RECEIVE after the request was taken and before the
+// reply is written, outside the model's locks, with the operation code. Lets a
+// test hold an exchange in flight behind a gate. An empty function removes it.
+VMSG_DEVICE_API void vmsgDeviceSetHostHook(std::function<void(uint32_t opCode)> hook);
