@@ -1,0 +1,71 @@
+// Captures what reaches the Android log (priority, tag, text) through liblog's
+// own logger hook, for tests that check lines written with __android_log_*.
+// One capture at a time; the destructor hands liblog back to its standard
+// error logger.
+#pragma once
+
+#include <android/log.h>
+
+#include <mutex>
+#include <string>
+#include <vector>
+
+struct AndroidLogLine {
+    int priority;
+    std::string tag;
+    std::string text;
+};
+
+class AndroidLogCapture {
+  public:
+    AndroidLogCapture() {
+        Sink& s = sink();
+        {  // acquire lock
+            std::lock_guard<std::mutex> lock(s.mutex);
+            s.lines.clear();
+        }  // release lock
+        __android_log_set_logger(&AndroidLogCapture::record);
+        previousMinimum_ = __android_log_set_minimum_priority(ANDROID_LOG_VERBOSE);
+    }
+    ~AndroidLogCapture() {
+        __android_log_set_minimum_priority(previousMinimum_);
+        __android_log_set_logger(__android_log_stderr_logger);
+    }
+    AndroidLogCapture(const AndroidLogCapture&) = delete;
+    AndroidLogCapture& operator=(const AndroidLogCapture&) = delete;
+
+    std::vector<AndroidLogLine> lines() const {
+        Sink& s = sink();
+        std::lock_guard<std::mutex> lock(s.mutex);
+        return s.lines;
+    }
+
+    // Lines whose text contains `needle`.
+    std::vector<AndroidLogLine> linesContaining(const std::string& needle) const {
+        std::vector<AndroidLogLine> found;
+        for (const AndroidLogLine& line : lines()) {
+            if (line.text.find(needle) != std::string::npos) found.push_back(line);
+        }
+        return found;
+    }
+
+  private:
+    struct Sink {
+        std::mutex mutex;
+        std::vector<AndroidLogLine> lines;
+    };
+
+    static Sink& sink() {
+        static Sink* const s = new Sink();  // outlives late lines at exit
+        return *s;
+    }
+
+    static void record(const struct __android_logger_data* data, const char* message) {
+        Sink& s = sink();
+        std::lock_guard<std::mutex> lock(s.mutex);
+        s.lines.push_back({data->priority, data->tag != nullptr ? data->tag : "",
+                           message != nullptr ? message : ""});
+    }
+
+    int previousMinimum_ = ANDROID_LOG_DEFAULT;
+};
