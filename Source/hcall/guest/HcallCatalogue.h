@@ -89,6 +89,13 @@ constexpr uint32_t kResultSize = 4;          // the result that ends every reply
 constexpr int kMaxParams = 8;
 constexpr uint32_t kNumOps = 43;
 
+// The code of each operation by name: kOp_hcallOpenUrlRpc is 26.
+enum OpCode : uint32_t {
+#define HCALL_OP_CODE(code, name, result, sig, params) kOp_##name = code,
+    HCALL_CATALOGUE(HCALL_OP_CODE)
+#undef HCALL_OP_CODE
+};
+
 // Bytes of reply a filled parameter takes, given the capacity of a buffer.
 constexpr uint32_t filledSize(Kind kind, uint32_t bufferLength) {
     return kind == Buf ? bufferLength : kind == OutI32 ? 4 : kind == OutU64 ? 8 : 0;
