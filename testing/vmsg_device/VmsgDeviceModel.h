@@ -78,6 +78,9 @@ struct VmsgDeviceScript {
     // when printCalls is set, its decoded call is written to standard error.
     std::string tracePath;
     bool printCalls = false;
+    // Keep exchanges and events for vmsgDeviceExchanges/Events. A benchmark
+    // turns it off: the host then allocates nothing on the exchange path.
+    bool record = true;
 };
 
 // One SEND_RECEIVE as the host saw it.
