@@ -1,4 +1,7 @@
 // One-shot callbacks after a delay, run in expiry order on one timer thread.
+//
+// Locking: `mutex` guards the map and the flag and is never held while a
+// callback runs, so a callback may schedule further callbacks.
 #pragma once
 
 #include <condition_variable>
@@ -11,14 +14,15 @@
 #include "xpl/XplExport.h"
 
 struct XtimerInfo {
-    long long expiry;
+    long long expiry;  // microseconds in the time base of xtimeNow
     std::function<void()> callback;
 };
 
 struct XtimerGlobals {
     std::condition_variable cond;
     std::mutex mutex;
-    int32_t threadStarted;
+    int32_t threadStarted = 0;  // 1 once the timer thread exists
+    // Keyed by expiry; an entry goes after those already there with its key.
     std::multimap<long long, XtimerInfo> timers;
 };
 
@@ -26,5 +30,9 @@ struct XtimerGlobals {
 XPL_EXPORT extern XtimerGlobals* g_xtimer;
 
 XPL_EXPORT xerr_t xtimerLibInit();
+// Runs the callback once, on the timer thread, `delay` microseconds from now
+// (at once for zero or less). The first call starts the timer thread; when it
+// cannot be created the error is returned and nothing is scheduled. An empty
+// callback is refused with XERR_INVAL.
 XPL_EXPORT xerr_t xtimerStart(long long delay, std::function<void()> callback);
-XPL_EXPORT void xtimerThreadEntry();
+[[noreturn]] XPL_EXPORT void xtimerThreadEntry();
