@@ -31,7 +31,7 @@ tsan: deps
 	  ctest --test-dir build-tsan --output-on-failure -j $(JOBS) -L cxx
 
 demo: build
-	@echo "The demo arrives with the service bridge."
+	demo/run-demo.sh build
 
 clean:
 	rm -rf build build-asan build-tsan
