@@ -107,8 +107,7 @@ TEST(XlogExit, WhenAnotherThreadLogsDuringExit_ProcessEndsCleanly) {
     constexpr int kRounds = 20;
     for (int round = 0; round < kRounds; ++round) {
         ChildOutcome outcome = runInChild([] {
-            static AndroidLogCapture* capture = new AndroidLogCapture();  // keep stderr quiet
-            (void)capture;
+            AndroidLogCapture capture;  // keeps standard error quiet
             static std::atomic<bool> logging{false};
             std::thread([] {
                 for (int i = 0;; ++i) {
