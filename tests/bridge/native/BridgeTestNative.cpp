@@ -1,6 +1,7 @@
 // Test-only JNI helper for the bridge's JVM tests: captures the Android log
 // through liblog's own hook, drives the preloaded device model, and reaches
 // getStringFromJstring with a runtime that cannot lend string bytes.
+#include <android_runtime/AndroidRuntime.h>
 #include <jni.h>
 
 #include <chrono>
@@ -215,6 +216,27 @@ Java_com_zelvane_server_bridgetest_TestNative_convertStarved(JNIEnv* env, jclass
     jint counts[3] = {jint(bytes.size()), starved.releases, starved.releasesOfNull};
     jintArray result = env->NewIntArray(3);
     if (result != nullptr) env->SetIntArrayRegion(result, 0, 3, counts);
+    return result;
+}
+
+static jint boundLater(JNIEnv*, jclass) { return 42; }
+
+// Registers one method through the runtime stand-in; returns {result, whether
+// an exception is left pending}.
+JNIEXPORT jintArray JNICALL Java_com_zelvane_server_bridgetest_TestNative_register(
+    JNIEnv* env, jclass, jstring className, jstring methodName, jstring signature) {
+    const char* cls = env->GetStringUTFChars(className, nullptr);
+    const char* name = env->GetStringUTFChars(methodName, nullptr);
+    const char* sig = env->GetStringUTFChars(signature, nullptr);
+    JNINativeMethod method{name, sig, reinterpret_cast<void*>(boundLater)};
+    jint outcome[2] = {android::AndroidRuntime::registerNativeMethods(env, cls, &method, 1), 0};
+    outcome[1] = env->ExceptionCheck() ? 1 : 0;
+    env->ExceptionClear();
+    env->ReleaseStringUTFChars(signature, sig);
+    env->ReleaseStringUTFChars(methodName, name);
+    env->ReleaseStringUTFChars(className, cls);
+    jintArray result = env->NewIntArray(2);
+    if (result != nullptr) env->SetIntArrayRegion(result, 0, 2, outcome);
     return result;
 }
 

@@ -24,6 +24,11 @@ final class TestNative {
     static native boolean awaitHostHeld(long timeoutMs);
     static native void releaseHost();
 
+    /** Bound through the runtime stand-in by {@link #register}. */
+    static native int boundLater();
+    /** {result, 1 if an exception is left pending} of registering one method. */
+    static native int[] register(String className, String methodName, String signature);
+
     static native byte[] convert(String s);
     /** {bytes converted, releases, releases of null} under a runtime out of memory. */
     static native int[] convertStarved(String s);
