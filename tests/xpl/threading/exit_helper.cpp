@@ -4,7 +4,7 @@
 //   pool-busy           the worker inside a task that never returns, a task
 //                       queued behind it
 //   pool-returning US   the worker returns from its task US microseconds
-//                       after the exit has begun
+//                       after the exit has begun, tasks queued behind it
 //   pool-adding         another thread still adding tasks throughout the exit
 //   timer-waiting       the timer thread in its timed wait for a far expiry
 //   timer-returning US  a callback returns US microseconds after the exit has
@@ -30,6 +30,17 @@ namespace {
 
 std::atomic<bool> g_exitBegun{false};
 long g_returnDelayUs = 0;
+
+// How long the process stays after the library's static objects are gone,
+// so that a thread coming back late meets the destroyed objects rather than
+// an ended process.
+constexpr std::chrono::microseconds kLinger{3000};
+
+// Constructed before every object of default priority, so destroyed after
+// them all, the library's pool among them.
+struct LingerAfterTeardown {
+    ~LingerAfterTeardown() { std::this_thread::sleep_for(kLinger); }
+} g_linger __attribute__((init_priority(101)));
 
 void say(const char* text) { (void)!write(STDOUT_FILENO, text, strlen(text)); }
 
@@ -95,6 +106,7 @@ int poolReturning() {
         started.open();
         returnAfterExitBegins();
     });
+    for (int i = 0; i < 3; ++i) xthrPoolAddTask(&g_thr_pool, [] {});
     started.wait();
     return 0;
 }
