@@ -419,6 +419,53 @@ TEST_F(VmsgDevice, Trace_WhenPathIsSet_WritesOneDecodableLinePerExchange) {
     unlink(path.c_str());
 }
 
+// Sends standard error to a file for the life of the object.
+class StderrCapture {
+  public:
+    StderrCapture() : mPath(::testing::TempDir() + "vmsg_stderr_" + std::to_string(getpid())) {
+        const int fd = ::open(mPath.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0600);
+        mSaved = dup(STDERR_FILENO);
+        dup2(fd, STDERR_FILENO);
+        close(fd);
+    }
+    ~StderrCapture() {
+        restore();
+        unlink(mPath.c_str());
+    }
+    std::string text() {
+        restore();
+        return readFile(mPath);
+    }
+
+  private:
+    void restore() {
+        if (mSaved < 0) return;
+        dup2(mSaved, STDERR_FILENO);
+        close(mSaved);
+        mSaved = -1;
+    }
+    std::string mPath;
+    int mSaved = -1;
+};
+
+TEST_F(VmsgDevice, Print_WhenSet_WritesEachCallAndEveryOverlapToStandardError) {
+    configure([](VmsgDeviceScript& s) {
+        s.printCalls = true;
+        s.results[12] = 3;
+    });
+    RawClient c;
+    ASSERT_TRUE(c.start());
+    StderrCapture capture;
+    ASSERT_EQ(c.exchange(hex(kLocale)), 0);
+    vmsgDeviceSetHostHook([&](uint32_t) { c.hostBound()[12] = 'E'; });
+    ASSERT_EQ(c.exchange(hex(kLocale)), 0);
+    EXPECT_EQ(capture.text(),
+              "hcallOnLocaleChangedRpc(\"en-US\") -> 3\n"
+              "vmsg-device: overlapping exchange: hcallOnLocaleChangedRpc(\"en-US\") -> 3\n"
+              "hcallOnLocaleChangedRpc(\"en-US\") -> 3\n")
+        << "the request as the host took it, before it was rewritten";
+}
+
 TEST(VmsgDeviceEnv, ScriptFromEnvironment_ReadsEveryVariableAndIgnoresBadOnes) {
     const std::pair<const char*, const char*> vars[] = {
         {"VMSG_DEVICE_CAPACITY", "0x200"},     {"VMSG_DEVICE_GUEST_CAPACITY", "300"},
