@@ -7,6 +7,8 @@
 
 #include <algorithm>
 #include <atomic>
+#include <chrono>
+#include <condition_variable>
 #include <cstring>
 #include <memory>
 #include <mutex>
@@ -211,6 +213,11 @@ class Device {
         std::lock_guard<std::mutex> lock(mMutex);
         return mOverlaps;
     }
+    bool waitForExchanges(size_t count, uint32_t timeoutMs) {
+        std::unique_lock<std::mutex> lock(mMutex);
+        return mRecorded.wait_for(lock, std::chrono::milliseconds(timeoutMs),
+                                  [&] { return mExchanges.size() >= count; });
+    }
     size_t openCount() {
         std::lock_guard<std::mutex> lock(mMutex);
         return mConnections.size();
@@ -379,7 +386,10 @@ class Device {
         e.sendErrno = x.sendErrno;
         e.overlapped = overlapped;
         report(e, s);
-        if (s.record) mExchanges.push_back(std::move(e));
+        if (s.record) {
+            mExchanges.push_back(std::move(e));
+            mRecorded.notify_all();
+        }
         VmsgDeviceEvent ev;
         ev.kind = VmsgDeviceEventKind::SendReceive;
         ev.fd = x.fd;
@@ -410,11 +420,17 @@ class Device {
         mTraceFd = -1;
         const std::string& path = mScript->tracePath;
         if (path.empty()) return;
+        if (isDevicePath(path.c_str())) {
+            // Opening it here would come back to this device under its lock.
+            writeAll(STDERR_FILENO, "vmsg-device: the device cannot trace into itself\n");
+            return;
+        }
         mTraceFd = ::open(path.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644);
         if (mTraceFd < 0) writeAll(STDERR_FILENO, "vmsg-device: cannot open trace " + path + "\n");
     }
 
     std::mutex mMutex;
+    std::condition_variable mRecorded;
     std::shared_ptr<const VmsgDeviceScript> mScript;
     std::map<int, Connection> mConnections;
     std::vector<VmsgDeviceExchange> mExchanges;
@@ -454,6 +470,9 @@ void vmsgDeviceReset() { vmsgdev::Device::get().reset(); }
 std::vector<VmsgDeviceExchange> vmsgDeviceExchanges() { return vmsgdev::Device::get().exchanges(); }
 std::vector<VmsgDeviceEvent> vmsgDeviceEvents() { return vmsgdev::Device::get().events(); }
 size_t vmsgDeviceOverlapCount() { return vmsgdev::Device::get().overlaps(); }
+bool vmsgDeviceWaitForExchanges(size_t count, uint32_t timeoutMs) {
+    return vmsgdev::Device::get().waitForExchanges(count, timeoutMs);
+}
 size_t vmsgDeviceOpenCount() { return vmsgdev::Device::get().openCount(); }
 void vmsgDeviceSetHostHook(std::function<void(uint32_t)> hook) {
     vmsgdev::Device::get().setHook(std::move(hook));

@@ -122,6 +122,10 @@ VMSG_DEVICE_API std::vector<VmsgDeviceEvent> vmsgDeviceEvents();
 // Exchanges that began while another was in flight or whose request bytes
 // changed while the host was serving them. Tests expect 0.
 VMSG_DEVICE_API size_t vmsgDeviceOverlapCount();
+// Waits until at least `count` exchanges are recorded (since the last reset)
+// or timeoutMs passes; true when they are. For tests whose host calls run on
+// another thread. Needs record on.
+VMSG_DEVICE_API bool vmsgDeviceWaitForExchanges(size_t count, uint32_t timeoutMs);
 // Device descriptors currently open.
 VMSG_DEVICE_API size_t vmsgDeviceOpenCount();
 

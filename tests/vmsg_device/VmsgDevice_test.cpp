@@ -73,6 +73,9 @@ class RawClient {
     size_t mLength = 0;
 };
 
+// How long a test waits for exchanges on other threads before it gives up.
+constexpr uint32_t kWaitToleranceMs = 30000;
+
 const char kLocale[] =
     "0C000000 12000000 06000000 656E2D555300";  // hcallOnLocaleChangedRpc("en-US")
 
@@ -369,9 +372,12 @@ TEST_F(VmsgDevice, Overlap_WhenThreadsTakeTurns_NoneIsReported) {
             }
         });
     }
+    EXPECT_TRUE(vmsgDeviceWaitForExchanges(100, kWaitToleranceMs))
+        << "the waiter wakes when the last exchange is recorded";
     for (std::thread& t : threads) t.join();
     EXPECT_EQ(vmsgDeviceOverlapCount(), 0u);
     EXPECT_EQ(vmsgDeviceExchanges().size(), 100u);
+    EXPECT_FALSE(vmsgDeviceWaitForExchanges(101, 0)) << "no 101st exchange ever comes";
 }
 
 TEST_F(VmsgDevice, Close_WhenDeviceDescriptorCloses_ItsNumberPassesThroughAgain) {
