@@ -157,6 +157,4 @@ TEST(Xtimer, Start_WhenCallbackEmpty_RefusesItAndSchedulesNothing) {
     EXPECT_EQ(g_xtimer->timers.size(), pending);
 }
 
-TEST(Xtimer, LibInit_ReturnsSuccess) { EXPECT_EQ(xtimerLibInit(), XERR_SUCCESS); }
-
 }  // namespace
