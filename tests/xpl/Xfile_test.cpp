@@ -302,23 +302,4 @@ TEST_F(XfileTest, Move_FlushesRenamesAndLogsAFailedFlush) {
     EXPECT_TRUE(S_ISDIR(modeOf(path("gone")))) << "the flush's open made the parent";
 }
 
-TEST_F(XfileTest, DeleteAndRemoveDirectory_ReportTheSystemResult) {
-    writeFile(path("f"), "x");
-    ASSERT_EQ(mkdir(path("d").c_str(), 0700), 0);
-    writeFile(path("d/inner"), "x");
-    EXPECT_EQ(xfileRemoveDirectory(path("d")), XERR_NOTEMPTY);
-    EXPECT_EQ(xfileDelete(path("d/inner")), XERR_SUCCESS);
-    EXPECT_EQ(xfileRemoveDirectory(path("d")), XERR_SUCCESS);
-    EXPECT_EQ(xfileDelete(path("f")), XERR_SUCCESS);
-    EXPECT_EQ(xfileDelete(path("f")), XERR_NOENT);
-}
-
-TEST_F(XfileTest, CleanPath_CopiesUnchanged) {
-    std::string out;
-    EXPECT_EQ(xfileCleanPath("a\\b//c/./d", out), XERR_SUCCESS);
-    EXPECT_EQ(out, "a\\b//c/./d");
-    EXPECT_EQ(xfileCleanPath(out, out), XERR_SUCCESS);
-    EXPECT_EQ(out, "a\\b//c/./d") << "the same object stays as it is";
-}
-
 }  // namespace

@@ -321,15 +321,4 @@ TEST_F(XlogConfigTest, UtcOffset_FollowsTheZoneAndItsStandardTime) {
     }
 }
 
-TEST_F(XlogConfigTest, ProcessTagAndFormat_AreStored) {
-    xlogSetProcessTag("svc");
-    EXPECT_EQ(g_xlog->processTag, "svc");
-    xlogSetProcessTag(g_xlog->processTag);
-    EXPECT_EQ(g_xlog->processTag, "svc") << "storing the stored string itself";
-    xlogSetFormat(true, false, true);
-    EXPECT_TRUE(g_xlog->formatFlags[0]);
-    EXPECT_FALSE(g_xlog->formatFlags[1]);
-    EXPECT_TRUE(g_xlog->formatFlags[2]);
-}
-
 }  // namespace

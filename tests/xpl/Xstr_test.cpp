@@ -6,8 +6,6 @@
 #include <string>
 #include <vector>
 
-#include "xpl/Xmem.h"
-
 namespace {
 
 using Fields = std::vector<std::string>;
@@ -34,32 +32,6 @@ TEST(XstrIcmp, WhenBytesAreAboveAscii_OrdersThemBeforeAscii) {
               static_cast<signed char>('\xC9') - static_cast<signed char>('\xE9'))
         << "the result is the difference of the signed bytes";
     EXPECT_LT(xstr_icmp("[", "A"), 0) << "letters fold to lower case, so 'A' meets '[' as 'a'";
-}
-
-TEST(XstrArrays, CopyHelpers_BehaveAsTheCLibrary) {
-    char* copy = xstr_dup("hello");
-    ASSERT_NE(copy, nullptr);
-    EXPECT_STREQ(copy, "hello");
-    xmem_free(copy);
-
-    char buf[8];
-    EXPECT_EQ(xstr_cpy(buf, "abc"), buf);
-    EXPECT_STREQ(buf, "abc");
-
-    std::memset(buf, 'z', sizeof(buf));
-    EXPECT_EQ(xstr_ncpy(buf, "abcdef", 3), buf);
-    EXPECT_EQ(std::string(buf, 4), "abcz") << "no terminator when the source is at least n long";
-
-    char out[6];
-    EXPECT_EQ(xstr_snprintf(out, sizeof(out), "%d-%s", 1234, "xyz"), 8)
-        << "returns the untruncated length";
-    EXPECT_STREQ(out, "1234-") << "truncated to the buffer with its terminator";
-
-    int a = 0;
-    char word[8] = "";
-    EXPECT_EQ(xstr_sscanf("17 abc", "%d %7s", &a, word), 2);
-    EXPECT_EQ(a, 17);
-    EXPECT_STREQ(word, "abc");
 }
 
 TEST(XstrPrintf, WhenFormatted_HoldsTheWholeOutput) {
