@@ -6,6 +6,7 @@
 #include <gtest/gtest.h>
 
 #include <atomic>
+#include <csignal>
 #include <cstdlib>
 #include <string>
 #include <thread>
@@ -98,6 +99,37 @@ TEST(XlogPrint, WhenCalledThroughTheStatement_SkipsUnwantedLinesWithoutEvaluatin
     XLOG_AT(XLOG_MODULE_XFILE, XLOG_LEVEL_E, kFile, kFunction, "%d", ++evaluated);
     EXPECT_EQ(evaluated, 1);
     EXPECT_EQ(capture.lines().size(), 1u);
+}
+
+TEST(XlogFatal, PrintsTheFatalLineThenBreaks) {
+    ChildOutcome trapped = runInChild([] {
+        XLOG_FATAL(XLOG_MODULE_XTHR, kFile, kFunction, "test");
+        return std::string("the break returned");
+    });
+    EXPECT_EQ(trapped.signal, SIGTRAP) << "the break raises SIGTRAP";
+
+    constexpr int kWrongLine = 3;
+    ChildOutcome ignored = runInChild([] {
+        signal(SIGTRAP, SIG_IGN);
+        static AndroidLogCapture* capture = new AndroidLogCapture();
+        // Runs inside the break's exit, so the fatal line must be there.
+        std::atexit([] {
+            auto lines = capture->lines();
+            const std::string head = "FATAL: DEBUG BREAK: tests/xpl/Xlog_test:";
+            const std::string tail = " test()";
+            bool ok =
+                lines.size() == 1 && lines[0].priority == ANDROID_LOG_ERROR &&
+                lines[0].text.compare(0, head.size(), head) == 0 &&
+                lines[0].text.size() > head.size() + tail.size() &&
+                lines[0].text.compare(lines[0].text.size() - tail.size(), tail.size(), tail) == 0;
+            if (!ok) _exit(kWrongLine);
+        });
+        XLOG_FATAL(XLOG_MODULE_XTHR, kFile, kFunction, "test");
+        return std::string("the break returned");
+    });
+    EXPECT_NE(ignored.exitCode, kWrongLine) << "the fatal line precedes the break";
+    EXPECT_TRUE(ignored.exited && ignored.exitCode == 1)
+        << "with SIGTRAP ignored the break exits with 1: " << ignored.message;
 }
 
 // The record and the kernel-log stream are never freed: a thread that logs
