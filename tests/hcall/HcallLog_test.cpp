@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <cstdio>
+#include <cstring>
 #include <memory>
 #include <string>
 
@@ -143,9 +144,11 @@ TEST_F(HcallLogTest, ExitLine_WhenHostLeavesBufferUnterminated_StopsAtItsCapacit
     HcallSession session(script);
     ASSERT_TRUE(session.connected());
     log.clear();
-    // Exactly the capacity, so that a sanitizer sees any read past it.
-    std::unique_ptr<char[]> buffer(new char[8]);
+    // Capacity 8, followed by bytes that a print running past it would show.
+    std::unique_ptr<char[]> buffer(new char[16]);
+    std::memset(buffer.get(), 'Z', 15);
     buffer[0] = '\0';
+    buffer[15] = '\0';
     int32_t value = 0;
 
     EXPECT_EQ(hcallGetPropsRpc(buffer.get(), 8, &value), 0);
