@@ -36,7 +36,9 @@ enum class VmsgDeviceReplyMode {
 struct VmsgDeviceScript {
     // Out-words of CONNECT. guestBoundOffset 0 means "right after the
     // host-bound buffer, rounded up to a page". The memfd is sized to
-    // guestBoundOffset + guestBoundCapacity, computed without wrapping.
+    // guestBoundOffset + guestBoundCapacity, computed without wrapping. A
+    // layout beyond 256 MiB (a sum that wraps in 32 bits, say) is answered
+    // but not backed: SEND_RECEIVE on it fails with EFAULT.
     uint32_t hostBoundCapacity = 65536;
     uint32_t guestBoundCapacity = 65536;
     uint32_t spare = 0;
