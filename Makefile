@@ -36,6 +36,7 @@ demo: build
 # Figures only: nothing here passes or fails on time.
 bench: build
 	HOSTCALL_TEST_KMSG=/dev/null build/bin/hcall_bench
+	bench/bridge/run-bench.sh build
 
 clean:
 	rm -rf build build-asan build-tsan
