@@ -20,23 +20,24 @@ enum : int {
 constexpr int XLOG_NUM_LEVELS = 5;
 
 // The module tags in module-number order; the number is the place in the list.
-#define XLOG_MODULES(X)                                                                    \
-    X(AGA) X(APN) X(APPC) X(AUD) X(BRIDGE) X(CAM) X(CLD) X(CONF) X(CSM) X(DCRD) X(GCALL) \
-    X(GR) X(GRM) X(HCALL) X(HVUTL) X(HST) X(IMAP) X(IMGD) X(INP) X(IPC) X(KMM) X(MIM)    \
-    X(MNS) X(PGA) X(PGAIPC) X(PLR) X(SER) X(UI) X(UTL) X(VMMGR) X(VMSG) X(WERH) X(XCOND) \
-    X(XFILE) X(XJSON) X(XLIB) X(XLOCK) X(XLOG) X(XMEM) X(XMUTEX) X(XPROC) X(XSOCK)       \
-    X(XSTR) X(XTHR) X(XTIME) X(XTIMER)
+#define XLOG_MODULES(X)                                                                        \
+    X(AGA)                                                                                     \
+    X(APN) X(APPC) X(AUD) X(BRIDGE) X(CAM) X(CLD) X(CONF) X(CSM) X(DCRD) X(GCALL) X(GR) X(GRM) \
+        X(HCALL) X(HVUTL) X(HST) X(IMAP) X(IMGD) X(INP) X(IPC) X(KMM) X(MIM) X(MNS) X(PGA)     \
+            X(PGAIPC) X(PLR) X(SER) X(UI) X(UTL) X(VMMGR) X(VMSG) X(WERH) X(XCOND) X(XFILE)    \
+                X(XJSON) X(XLIB) X(XLOCK) X(XLOG) X(XMEM) X(XMUTEX) X(XPROC) X(XSOCK) X(XSTR)  \
+                    X(XTHR) X(XTIME) X(XTIMER)
 
 enum : int {
 #define XLOG_DECLARE_MODULE(tag) XLOG_MODULE_##tag,
     XLOG_MODULES(XLOG_DECLARE_MODULE)
 #undef XLOG_DECLARE_MODULE
-    XLOG_NUM_MODULES
+        XLOG_NUM_MODULES
 };
 static_assert(XLOG_NUM_MODULES == 46, "the module table has 46 tags");
 static_assert(XLOG_MODULE_HCALL == 13 && XLOG_MODULE_HVUTL == 14 && XLOG_MODULE_HST == 15 &&
-                  XLOG_MODULE_VMSG == 30 && XLOG_MODULE_XFILE == 33 &&
-                  XLOG_MODULE_XLOG == 37 && XLOG_MODULE_XTHR == 43,
+                  XLOG_MODULE_VMSG == 30 && XLOG_MODULE_XFILE == 33 && XLOG_MODULE_XLOG == 37 &&
+                  XLOG_MODULE_XTHR == 43,
               "module numbers are part of the log configuration format");
 
 // The logger interface. Note the argument order: shouldLog takes the module
@@ -69,13 +70,13 @@ XPL_EXPORT extern XlogState* g_xlog;
 extern "C" XPL_EXPORT XlogLogger* xlogGetLogger();
 
 XPL_EXPORT int xlogShouldLog(int module, int level);
-XPL_EXPORT void xlogPrint(int level, int module, const char* file, const char* function,
-                          int line, const char* format, ...) __attribute__((format(printf, 6, 7)));
+XPL_EXPORT void xlogPrint(int level, int module, const char* file, const char* function, int line,
+                          const char* format, ...) __attribute__((format(printf, 6, 7)));
 
 // Log configuration.
 XPL_EXPORT xerr_t xlogLibInit(const XlogLogger* logger, const std::string& logFile,
                               const std::string& levels);
-XPL_EXPORT xerr_t xlogSetLevels(const std::string& spec);
+XPL_EXPORT xerr_t xlogSetLevels(const std::string& levels);
 XPL_EXPORT xerr_t xlogSetFile(const std::string& logFile);
 XPL_EXPORT void xlogSetProcessTag(const std::string& processTag);
 XPL_EXPORT void xlogSetFormat(bool first, bool second, bool third);
@@ -84,22 +85,21 @@ XPL_EXPORT void xlogCurrentTime(char* buf, int size);
 // The logging statement: ask the active logger, and only on a yes evaluate the
 // message arguments and print. `file` is the caller's source path and
 // `function` its signature text.
-#define XLOG_AT(module, level, file, function, ...)                                   \
-    do {                                                                              \
-        XlogLogger* xlog_logger_ = xlogGetLogger();                                   \
-        if (xlog_logger_->shouldLog((module), (level)))                               \
-            xlog_logger_->print((level), (module), (file), (function), __LINE__,      \
-                                __VA_ARGS__);                                         \
+#define XLOG_AT(module, level, file, function, ...)                                            \
+    do {                                                                                       \
+        XlogLogger* xlog_logger_ = xlogGetLogger();                                            \
+        if (xlog_logger_->shouldLog((module), (level)))                                        \
+            xlog_logger_->print((level), (module), (file), (function), __LINE__, __VA_ARGS__); \
     } while (0)
 
 // The fatal line alone, for failures the caller recovers from.
-#define XLOG_FATAL_LINE(module, file, function, shortName)                         \
-    XLOG_AT((module), XLOG_LEVEL_E, (file), (function), "FATAL: DEBUG BREAK: %s:%d %s()", \
-            (file), __LINE__, (shortName))
+#define XLOG_FATAL_LINE(module, file, function, shortName)                                        \
+    XLOG_AT((module), XLOG_LEVEL_E, (file), (function), "FATAL: DEBUG BREAK: %s:%d %s()", (file), \
+            __LINE__, (shortName))
 
 // The fatal-error statement: the fatal line, then the debug break.
-#define XLOG_FATAL(module, file, function, shortName)              \
-    do {                                                           \
+#define XLOG_FATAL(module, file, function, shortName)               \
+    do {                                                            \
         XLOG_FATAL_LINE((module), (file), (function), (shortName)); \
-        xdbgBreak();                                               \
+        xdbgBreak();                                                \
     } while (0)

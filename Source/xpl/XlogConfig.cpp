@@ -1,4 +1,4 @@
-// Start-up and settings of the logger: tables, level specifications, the log
+// Start-up and settings of the logger: tables, level strings, the log
 // file and its rotation, the time stamp.
 #include <string>
 #include <vector>
@@ -113,13 +113,13 @@ xerr_t xlogLibInit(const XlogLogger* logger, const std::string& logFile,
     return XERR_SUCCESS;
 }
 
-xerr_t xlogSetLevels(const std::string& spec) {
+xerr_t xlogSetLevels(const std::string& levels) {
     XLOG_AT(XLOG_MODULE_XLOG, XLOG_LEVEL_D, kSourcePath, "xerr_t xlogSetLevels(const string &)",
-            "Change log levels with: %s", spec.c_str());
+            "Change log levels with: %s", levels.c_str());
     XlogState* state = xlogState();
     xerr_t err = XERR_SUCCESS;
     // Tokens apply as read: a malformed one stops the rest, earlier ones stay.
-    for (const std::string& token : xstrSplit(spec, " ")) {
+    for (const std::string& token : xstrSplit(levels, " ")) {
         err = applyToken(state, token);
         if (err != XERR_SUCCESS) break;
     }

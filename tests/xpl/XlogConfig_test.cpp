@@ -162,7 +162,7 @@ TEST_F(XlogConfigTest, LibInitWithLogger_InstallsACopyAndLeavesTheTables) {
 
 TEST_F(XlogConfigTest, SetLevels_AppliesTokensInOrderUntilAMalformedOne) {
     const struct {
-        const char* spec;
+        const char* levels;
         xerr_t result;
         int hcall;  // HCALL's level afterwards, starting from I
         int xmem;   // XMEM's level afterwards, starting from D
@@ -182,9 +182,9 @@ TEST_F(XlogConfigTest, SetLevels_AppliesTokensInOrderUntilAMalformedOne) {
     };
     for (const auto& c : cases) {
         ASSERT_EQ(xlogSetLevels("*:I XMEM:D"), XERR_SUCCESS);
-        EXPECT_EQ(xlogSetLevels(c.spec), c.result) << "'" << c.spec << "'";
-        EXPECT_EQ(levelOf(XLOG_MODULE_HCALL), c.hcall) << "HCALL after '" << c.spec << "'";
-        EXPECT_EQ(levelOf(XLOG_MODULE_XMEM), c.xmem) << "XMEM after '" << c.spec << "'";
+        EXPECT_EQ(xlogSetLevels(c.levels), c.result) << "'" << c.levels << "'";
+        EXPECT_EQ(levelOf(XLOG_MODULE_HCALL), c.hcall) << "HCALL after '" << c.levels << "'";
+        EXPECT_EQ(levelOf(XLOG_MODULE_XMEM), c.xmem) << "XMEM after '" << c.levels << "'";
     }
 }
 
