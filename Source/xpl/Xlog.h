@@ -20,13 +20,14 @@ enum : int {
 constexpr int XLOG_NUM_LEVELS = 5;
 
 // The module tags in module-number order; the number is the place in the list.
-#define XLOG_MODULES(X)                                                                        \
-    X(AGA)                                                                                     \
-    X(APN) X(APPC) X(AUD) X(BRIDGE) X(CAM) X(CLD) X(CONF) X(CSM) X(DCRD) X(GCALL) X(GR) X(GRM) \
-        X(HCALL) X(HVUTL) X(HST) X(IMAP) X(IMGD) X(INP) X(IPC) X(KMM) X(MIM) X(MNS) X(PGA)     \
-            X(PGAIPC) X(PLR) X(SER) X(UI) X(UTL) X(VMMGR) X(VMSG) X(WERH) X(XCOND) X(XFILE)    \
-                X(XJSON) X(XLIB) X(XLOCK) X(XLOG) X(XMEM) X(XMUTEX) X(XPROC) X(XSOCK) X(XSTR)  \
-                    X(XTHR) X(XTIME) X(XTIMER)
+// clang-format off
+#define XLOG_MODULES(X)                                                                    \
+    X(AGA) X(APN) X(APPC) X(AUD) X(BRIDGE) X(CAM) X(CLD) X(CONF) X(CSM) X(DCRD) X(GCALL) \
+    X(GR) X(GRM) X(HCALL) X(HVUTL) X(HST) X(IMAP) X(IMGD) X(INP) X(IPC) X(KMM) X(MIM)    \
+    X(MNS) X(PGA) X(PGAIPC) X(PLR) X(SER) X(UI) X(UTL) X(VMMGR) X(VMSG) X(WERH) X(XCOND) \
+    X(XFILE) X(XJSON) X(XLIB) X(XLOCK) X(XLOG) X(XMEM) X(XMUTEX) X(XPROC) X(XSOCK)       \
+    X(XSTR) X(XTHR) X(XTIME) X(XTIMER)
+// clang-format on
 
 enum : int {
 #define XLOG_DECLARE_MODULE(tag) XLOG_MODULE_##tag,
