@@ -9,8 +9,6 @@
 #include <map>
 #include <string>
 
-#include "hcall/guest/HcallFormat.h"
-
 namespace {
 
 std::vector<std::string> split(const std::string& list) {
@@ -48,16 +46,6 @@ TEST(HcallCatalogue, EveryOperation_MatchesItsSignatureText) {
     EXPECT_EQ(hcall::findOp(0), nullptr);
     EXPECT_EQ(hcall::findOp(44), nullptr);
     EXPECT_STREQ(hcall::findOp(24)->name, "hcallIsAppLaunchAllowedRpc");
-}
-
-TEST(HcallCatalogue, Formats_FollowTheParameterKinds) {
-    EXPECT_STREQ(hcall::Formats<1>::entry.text, "%s(%s, %d, %p)\n");
-    EXPECT_STREQ(hcall::Formats<1>::exit.text, "returning [%d] from %s(%s, %d, %p)\n");
-    EXPECT_STREQ(hcall::Formats<1>::boundedExit.text, "returning [%d] from %s(%.*s, %d, %p)\n");
-    EXPECT_STREQ(hcall::Formats<5>::entry.text, "%s(%p, %s, %d)\n");
-    EXPECT_STREQ(hcall::Formats<13>::entry.text, "%s(%s, %s, %s, %d, %s, %s, %s, %d)\n");
-    EXPECT_STREQ(hcall::Formats<16>::entry.text, "%s()\n");
-    EXPECT_STREQ(hcall::Formats<22>::exit.text, "returning [%d] from %s(%s, %d, %d, %s, %d)\n");
 }
 
 }  // namespace

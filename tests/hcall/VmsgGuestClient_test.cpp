@@ -7,6 +7,7 @@
 
 #include <cerrno>
 #include <cstring>
+#include <functional>
 #include <string>
 
 #include "DeviceSession.h"
@@ -44,17 +45,6 @@ class VmsgGuestClientTest : public ::testing::Test {
     LogRecorder log;
     VmsgGuestClient client;
 };
-
-TEST_F(VmsgGuestClientTest, Construct_WhenNew_IsNotConnected) {
-    EXPECT_EQ(client.mFd, -1);
-    EXPECT_EQ(client.mMaxHostBoundSize, 0u);
-    EXPECT_EQ(client.mMaxGuestBoundSize, 0u);
-    EXPECT_EQ(client.mSpare, 0u);
-    EXPECT_EQ(client.mGuestBoundOffset, 0u);
-    EXPECT_EQ(client.mHostBoundBuf, nullptr);
-    EXPECT_EQ(client.mGuestBoundBuf, nullptr);
-    EXPECT_EQ(client.mServiceName, "");
-}
 
 TEST_F(VmsgGuestClientTest, Connect_WhenDeviceAnswers_OpensConnectsAndMapsAsTheDeviceSays) {
     VmsgDeviceScript script;
@@ -116,7 +106,7 @@ TEST_F(VmsgGuestClientTest, ProcessRequest_WhenConnected_SharesBothBuffersWithTh
     EXPECT_EQ(result, 0x12345678) << "the guest reads the reply the host wrote";
 }
 
-TEST_F(VmsgGuestClientTest, GetHostBoundBuffer_AtCapacityBoundaries_AcceptsUpToCapacity) {
+TEST_F(VmsgGuestClientTest, Exchange_AtCapacityBoundaries_AcceptsUpToCapacity) {
     VmsgDeviceScript script;
     script.hostBoundCapacity = 256;
     configure(script);
@@ -127,9 +117,11 @@ TEST_F(VmsgGuestClientTest, GetHostBoundBuffer_AtCapacityBoundaries_AcceptsUpToC
     EXPECT_EQ(client.getHostBoundBuffer(255), client.mHostBoundBuf);
     EXPECT_EQ(client.getHostBoundBuffer(256), client.mHostBoundBuf);
     EXPECT_EQ(client.getHostBoundBuffer(257), nullptr);
+    EXPECT_EQ(client.processRequest(client.mHostBoundBuf, 257), nullptr);
+    EXPECT_EQ(countEvents(VmsgDeviceEventKind::SendReceive), 0u) << "nothing is sent";
 
     std::vector<LoggedLine> lines = errors();
-    ASSERT_EQ(lines.size(), 1u);
+    ASSERT_EQ(lines.size(), 1u) << "processRequest refuses without a line of its own";
     EXPECT_EQ(lines[0].function, kGetHostBoundBuffer);
     EXPECT_EQ(lines[0].text, std::string(kGetHostBoundBuffer) + ":" +
                                  std::to_string(lines[0].line) + " len 257, mMaxHostBoundSize 256");
@@ -137,18 +129,11 @@ TEST_F(VmsgGuestClientTest, GetHostBoundBuffer_AtCapacityBoundaries_AcceptsUpToC
               log.lines(XLOG_MODULE_VMSG)[0].text);
 }
 
-TEST_F(VmsgGuestClientTest, ProcessRequest_WhenLongerThanCapacity_SendsNothing) {
-    VmsgDeviceScript script;
-    script.hostBoundCapacity = 256;
-    configure(script);
-    ASSERT_TRUE(client.connect(kHcal));
-
-    EXPECT_EQ(client.processRequest(client.mHostBoundBuf, 257), nullptr);
-    EXPECT_EQ(countEvents(VmsgDeviceEventKind::SendReceive), 0u);
-    EXPECT_TRUE(errors().empty()) << "the refusal has no line of its own";
-}
-
 TEST_F(VmsgGuestClientTest, GetHostBoundBuffer_BeforeConnect_RefusesEveryRequest) {
+    EXPECT_EQ(client.mFd, -1);
+    EXPECT_EQ(client.mMaxHostBoundSize, 0u);
+    EXPECT_EQ(client.mHostBoundBuf, nullptr);
+    EXPECT_EQ(client.mServiceName, "");
     EXPECT_EQ(client.getHostBoundBuffer(1), nullptr);
     EXPECT_EQ(client.getHostBoundBuffer(0), nullptr) << "there is no buffer to hand out";
     EXPECT_EQ(client.processRequest(nullptr, 0), nullptr);
@@ -157,18 +142,6 @@ TEST_F(VmsgGuestClientTest, GetHostBoundBuffer_BeforeConnect_RefusesEveryRequest
     EXPECT_EQ(errors()[0].text, std::string(kGetHostBoundBuffer) + ":" +
                                     std::to_string(errors()[0].line) +
                                     " len 1, mMaxHostBoundSize 0");
-}
-
-// Regression: capacities outlive a disconnect, so an exchange was let through
-// onto an unmapped buffer and a closed descriptor.
-TEST_F(VmsgGuestClientTest, Exchange_AfterDisconnect_IsRefused) {
-    ASSERT_TRUE(client.connect(kHcal));
-    client.disconnect();
-    vmsgDeviceReset();
-
-    EXPECT_EQ(client.getHostBoundBuffer(16), nullptr);
-    EXPECT_EQ(client.processRequest(nullptr, 16), nullptr);
-    EXPECT_EQ(vmsgDeviceEvents().size(), 0u);
 }
 
 TEST_F(VmsgGuestClientTest, Disconnect_WhenConnected_ReleasesDeviceAndKeepsTheRecord) {
@@ -197,116 +170,97 @@ TEST_F(VmsgGuestClientTest, Disconnect_WhenConnected_ReleasesDeviceAndKeepsTheRe
     EXPECT_EQ(log.lines(XLOG_MODULE_VMSG)[0].function, kDisconnect);
 }
 
-TEST_F(VmsgGuestClientTest, Disconnect_WhenNotConnected_OnlyTraces) {
+// Regression: capacities outlive a disconnect, so an exchange was let through
+// onto an unmapped buffer and a closed descriptor.
+TEST_F(VmsgGuestClientTest, Exchange_AfterDisconnect_IsRefusedAndDisconnectOnlyTraces) {
+    ASSERT_TRUE(client.connect(kHcal));
     client.disconnect();
+    vmsgDeviceReset();
+    log.clear();
+
+    EXPECT_EQ(client.getHostBoundBuffer(16), nullptr);
+    EXPECT_EQ(client.processRequest(nullptr, 16), nullptr);
     client.disconnect();
-    EXPECT_EQ(vmsgDeviceEvents().size(), 0u);
-    std::vector<LoggedLine> lines = log.lines(XLOG_MODULE_VMSG);
-    ASSERT_EQ(lines.size(), 2u);
-    EXPECT_EQ(lines[1].text, calledFor(lines[1], ""));
+    EXPECT_EQ(vmsgDeviceEvents().size(), 0u) << "nothing reaches the device";
+    EXPECT_EQ(log.texts(XLOG_MODULE_VMSG).back(),
+              calledFor(log.lines(XLOG_MODULE_VMSG).back(), "hcal"));
 }
 
-// The failure table, one row each: the error line, the outcome, and no
-// descriptor left behind.
-TEST_F(VmsgGuestClientTest, Connect_WhenOpenFails_ReportsAndStaysUnconnected) {
-    VmsgDeviceScript script;
-    script.openErrno = ENOENT;
-    configure(script);
+// The connection failures, one row each: the error line, and the client left
+// unconnected with no descriptor behind. The last two rows guard regressions:
+// a mapping length that wrapped in 32 bits mapped a sliver, and a host-bound
+// capacity beyond the mapping let requests run past its end.
+TEST_F(VmsgGuestClientTest, Connect_WhenAStepFails_ReportsAndStaysUnconnected) {
+    struct Row {
+        const char* what;
+        std::function<void(VmsgDeviceScript&)> fault;
+        VmsgServiceId id;
+        std::string line;  // after "<signature>: service "
+    };
+    const std::string e = ", errno ";
+    const Row rows[] = {
+        {"open", [](VmsgDeviceScript& s) { s.openErrno = ENOENT; }, kHcal,
+         "hcal: open failed for /dev/kivvmsg"},
+        {"connect", [](VmsgDeviceScript& s) { s.connectErrno = EIO; }, kHcal,
+         "hcal: connection ioctl failed: ret -1, errno 5"},
+        {"unknown service", [](VmsgDeviceScript&) {}, 0x64636261,
+         "abcd: connection ioctl failed: ret -1" + e + std::to_string(ECONNREFUSED)},
+        {"empty name", [](VmsgDeviceScript&) {}, 0x6C616300,
+         ": connection ioctl failed: ret -1" + e + std::to_string(ECONNREFUSED)},
+        {"mmap",
+         [](VmsgDeviceScript& s) {
+             s.guestBoundOffset = 4096;
+             s.guestBoundCapacity = 4096;
+             s.mmapFails = true;
+         },
+         kHcal, "hcal: mmap() failed: size 8192" + e + std::to_string(EPERM)},
+        {"wrapping length",
+         [](VmsgDeviceScript& s) {
+             s.guestBoundOffset = 0xFFFFF000;
+             s.guestBoundCapacity = 0x2000;
+         },
+         kHcal, "hcal: mmap() failed: size 4294971392" + e + std::to_string(EOVERFLOW)},
+        {"host-bound beyond mapping",
+         [](VmsgDeviceScript& s) {
+             s.hostBoundCapacity = 65536;
+             s.guestBoundOffset = 256;
+             s.guestBoundCapacity = 256;
+         },
+         kHcal, "hcal: mmap() failed: size 512" + e + std::to_string(EINVAL)},
+    };
+    for (const Row& row : rows) {
+        VmsgGuestClient fresh;
+        VmsgDeviceScript script;
+        script.hostBoundCapacity = 4096;
+        row.fault(script);
+        vmsgDeviceReset();
+        configure(script);
+        log.clear();
 
-    EXPECT_FALSE(client.connect(kHcal));
-    EXPECT_EQ(client.mFd, -1);
-    ASSERT_EQ(errors().size(), 1u);
-    EXPECT_EQ(errors()[0].text,
-              std::string(kConnect) + ": service hcal: open failed for /dev/kivvmsg");
-    EXPECT_EQ(errors()[0].function, kConnect);
-    EXPECT_EQ(errors()[0].file, kSource);
+        EXPECT_FALSE(fresh.connect(row.id)) << row.what;
+        EXPECT_EQ(fresh.mFd, -1) << row.what;
+        EXPECT_EQ(vmsgDeviceOpenCount(), 0u) << row.what << ": the device is closed again";
+        ASSERT_EQ(errors().size(), 1u) << row.what;
+        EXPECT_EQ(errors()[0].text, std::string(kConnect) + ": service " + row.line) << row.what;
+        EXPECT_EQ(errors()[0].file, kSource);
+        EXPECT_EQ(fresh.getHostBoundBuffer(16), nullptr)
+            << row.what << ": capacities left by a failed connect do not make it connected";
+    }
 }
 
-TEST_F(VmsgGuestClientTest, Connect_WhenConnectRequestFails_ClosesTheDevice) {
-    VmsgDeviceScript script;
-    script.connectErrno = EIO;
-    configure(script);
-
-    EXPECT_FALSE(client.connect(kHcal));
-    EXPECT_EQ(client.mFd, -1);
-    EXPECT_EQ(vmsgDeviceOpenCount(), 0u) << "the device is closed again";
-    ASSERT_EQ(errors().size(), 1u);
-    EXPECT_EQ(errors()[0].text,
-              std::string(kConnect) + ": service hcal: connection ioctl failed: ret -1, errno 5");
-}
-
-TEST_F(VmsgGuestClientTest, Connect_WhenServiceUnknown_NamesItFromTheIdBytes) {
+TEST_F(VmsgGuestClientTest, Connect_AfterFailure_KeepsNewNameAndOutWords) {
     EXPECT_FALSE(client.connect(0x64636261));
-    EXPECT_EQ(client.mServiceName, "abcd");
-    ASSERT_EQ(errors().size(), 1u);
-    EXPECT_EQ(errors()[0].text, std::string(kConnect) +
-                                    ": service abcd: connection ioctl failed: ret -1, errno " +
-                                    std::to_string(ECONNREFUSED));
-
-    EXPECT_FALSE(client.connect(0x6C616300));
-    EXPECT_EQ(client.mServiceName, "") << "a low byte of 0 ends the name at once";
-    EXPECT_EQ(log.lines(XLOG_MODULE_VMSG).back().text,
-              std::string(kConnect) + ": service : connection ioctl failed: ret -1, errno " +
-                  std::to_string(ECONNREFUSED));
-    EXPECT_EQ(log.texts(XLOG_MODULE_VMSG)[2], calledFor(log.lines(XLOG_MODULE_VMSG)[2], "abcd"))
-        << "the trace names the service of the earlier call";
-}
-
-TEST_F(VmsgGuestClientTest, Connect_WhenMappingFails_ClosesTheDeviceAndKeepsTheOutWords) {
     VmsgDeviceScript script;
-    script.hostBoundCapacity = 4096;
-    script.guestBoundCapacity = 4096;
-    script.guestBoundOffset = 4096;
     script.mmapFails = true;
+    script.hostBoundCapacity = 1234;
     configure(script);
+    log.clear();
 
     EXPECT_FALSE(client.connect(kHcal));
-    EXPECT_EQ(client.mFd, -1);
-    EXPECT_EQ(vmsgDeviceOpenCount(), 0u);
-    EXPECT_EQ(client.mMaxHostBoundSize, 4096u) << "the out-words stay in the record";
-    EXPECT_EQ(client.mGuestBoundOffset, 4096u);
-    ASSERT_EQ(errors().size(), 1u);
-    EXPECT_EQ(errors()[0].text, std::string(kConnect) +
-                                    ": service hcal: mmap() failed: size 8192, errno " +
-                                    std::to_string(EPERM));
-
-    EXPECT_EQ(client.getHostBoundBuffer(16), nullptr)
-        << "capacities left by a failed connect do not make it connected";
-}
-
-// Regression: the mapping length is a 32-bit sum of two device values; a sum
-// that wrapped mapped a sliver and handed out buffers far beyond it.
-TEST_F(VmsgGuestClientTest, Connect_WhenMappingLengthWraps_RefusesAsAMappingFailure) {
-    VmsgDeviceScript script;
-    script.hostBoundCapacity = 4096;
-    script.guestBoundOffset = 0xFFFFF000;
-    script.guestBoundCapacity = 0x2000;
-    configure(script);
-
-    EXPECT_FALSE(client.connect(kHcal));
-    EXPECT_EQ(client.mFd, -1);
-    EXPECT_EQ(vmsgDeviceOpenCount(), 0u);
-    ASSERT_EQ(errors().size(), 1u);
-    EXPECT_EQ(errors()[0].text, std::string(kConnect) +
-                                    ": service hcal: mmap() failed: size 4294971392, errno " +
-                                    std::to_string(EOVERFLOW));
-}
-
-// Regression: a host-bound capacity larger than the mapping let a request run
-// past the mapping's end.
-TEST_F(VmsgGuestClientTest, Connect_WhenHostBoundBufferExceedsTheMapping_Refuses) {
-    VmsgDeviceScript script;
-    script.hostBoundCapacity = 65536;
-    script.guestBoundOffset = 256;
-    script.guestBoundCapacity = 256;
-    configure(script);
-
-    EXPECT_FALSE(client.connect(kHcal));
-    EXPECT_EQ(vmsgDeviceOpenCount(), 0u);
-    ASSERT_EQ(errors().size(), 1u);
-    EXPECT_EQ(errors()[0].text, std::string(kConnect) +
-                                    ": service hcal: mmap() failed: size 512, errno " +
-                                    std::to_string(EINVAL));
+    EXPECT_EQ(log.texts(XLOG_MODULE_VMSG)[0], calledFor(log.lines(XLOG_MODULE_VMSG)[0], "abcd"))
+        << "the trace names the service of the earlier call";
+    EXPECT_EQ(client.mServiceName, "hcal");
+    EXPECT_EQ(client.mMaxHostBoundSize, 1234u) << "out-words of a successful CONNECT stay";
 }
 
 TEST_F(VmsgGuestClientTest, ProcessRequest_WhenSendReceiveFails_ReportsAndReturnsNull) {

@@ -117,12 +117,9 @@ void* VmsgGuestClient::getHostBoundBuffer(uint32_t len) {
 
 void* VmsgGuestClient::processRequest(void* /*request*/, uint32_t len) {
     VMSG_TRACE(kProcessRequest, "called for %s\n", mServiceName.c_str());
-    if (len > mMaxHostBoundSize) return nullptr;
-    if (mFd < 0) {
-        VMSG_ERROR(kProcessRequest, "%s: service %s: not connected", kProcessRequest,
-                   mServiceName.c_str());
-        return nullptr;
-    }
+    // Refused without a line of its own, like an oversized request: the
+    // caller's getHostBoundBuffer has already said why.
+    if (len > mMaxHostBoundSize || mFd < 0) return nullptr;
     // The request is whatever lies at the start of the host-bound buffer; its
     // length reaches the host through the service's own framing.
     int ret = ::ioctl(mFd, VMSG_IOC_SEND_RECEIVE);
