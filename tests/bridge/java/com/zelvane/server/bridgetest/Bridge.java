@@ -79,8 +79,10 @@ final class Bridge {
         });
         if (debugOn) {
             String returning = "3|" + TAG + "|" + SENTINEL_TASK + ": returning, rval = 0";
-            await("the sentinel's returning line",
-                    () -> logLines().subList(before, logLines().size()).contains(returning));
+            await("the sentinel's returning line", () -> {
+                List<String> lines = logLines();
+                return lines.subList(before, lines.size()).contains(returning);
+            });
         }
         List<byte[]> delivered = requests();
         delivered.removeIf(r -> Arrays.equals(r, SENTINEL));

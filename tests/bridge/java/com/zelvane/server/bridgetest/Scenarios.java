@@ -94,12 +94,13 @@ public final class Scenarios {
         result("openDevices", TestNative.openDevices());
     }
 
-    /** Threads whose name (inherited from the thread that created them) is `name`. */
-    static long threadsNamed(String name) throws IOException {
+    /** Threads other than `except` whose name (inherited from their creator) is `name`. */
+    static long threadsNamed(String name, Path except) throws IOException {
         try (var tasks = Files.list(Path.of("/proc/self/task"))) {
             return tasks.filter(t -> {
                 try {
-                    return Files.readString(t.resolve("comm")).trim().equals(name);
+                    return !t.getFileName().equals(except.getFileName())
+                            && Files.readString(t.resolve("comm")).trim().equals(name);
                 } catch (IOException e) {
                     return false;  // the thread ended meanwhile
                 }
@@ -107,20 +108,35 @@ public final class Scenarios {
         }
     }
 
-    static void initOn(KivHostCallService s, String threadName) throws InterruptedException {
-        Thread caller = new Thread(s::native_init, threadName);
-        caller.start();
-        caller.join();
+    /**
+     * Calls native_init on a new thread named `threadName` and counts the
+     * threads it started, which carry its name, while it is still alive.
+     */
+    static long threadsStartedByInit(KivHostCallService s, String threadName) throws Exception {
+        java.util.concurrent.CountDownLatch counted = new java.util.concurrent.CountDownLatch(1);
+        java.util.concurrent.CompletableFuture<Path> caller = new java.util.concurrent.CompletableFuture<>();
+        Thread thread = new Thread(() -> {
+            s.native_init();
+            try {
+                caller.complete(Files.readSymbolicLink(Path.of("/proc/thread-self")));
+                counted.await();
+            } catch (IOException | InterruptedException e) {
+                caller.completeExceptionally(e);
+            }
+        }, threadName);
+        thread.start();
+        long started = threadsNamed(threadName, caller.get());
+        counted.countDown();
+        thread.join();
+        return started;
     }
 
     static void secondInit() throws Exception {
         writeDebugProperty("0");
         KivHostCallService s = Bridge.load();
-        initOn(s, "hcinit-first");
-        result("workersFromFirstInit", threadsNamed("hcinit-first"));
+        result("workersFromFirstInit", threadsStartedByInit(s, "hcinit-first"));
         writeDebugProperty("1");
-        initOn(s, "hcinit-second");
-        result("workersFromSecondInit", threadsNamed("hcinit-second"));
+        result("workersFromSecondInit", threadsStartedByInit(s, "hcinit-second"));
         result("connects", TestNative.connects());
         result("openDevices", TestNative.openDevices());
         result("orientation", s.native_onOrientationChange(4));
