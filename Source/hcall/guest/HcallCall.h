@@ -17,45 +17,19 @@
 
 namespace hcall {
 
-inline constexpr char kEncSource[] = "Source/hcall/guest/HcallEnc";
-
 // The C type of each kind of parameter and result.
-template <Kind K>
-struct KindType;
-template <>
-struct KindType<Str> {
-    using type = const char*;
-};
-template <>
-struct KindType<I32> {
-    using type = int32_t;
-};
-template <>
-struct KindType<Bool> {
-    using type = bool;
-};
-template <>
-struct KindType<Buf> {
-    using type = char*;
-};
-template <>
-struct KindType<OutI32> {
-    using type = int32_t*;
-};
-template <>
-struct KindType<OutU64> {
-    using type = uint64_t*;
-};
-template <Result R>
-struct ResultType;
-template <>
-struct ResultType<Xerr> {
-    using type = xerr_t;
-};
-template <>
-struct ResultType<Flag> {
-    using type = bool;
-};
+// clang-format off
+template <Kind K> struct KindType;
+template <> struct KindType<Str> { using type = const char*; };
+template <> struct KindType<I32> { using type = int32_t; };
+template <> struct KindType<Bool> { using type = bool; };
+template <> struct KindType<Buf> { using type = char*; };
+template <> struct KindType<OutI32> { using type = int32_t*; };
+template <> struct KindType<OutU64> { using type = uint64_t*; };
+template <Result R> struct ResultType;
+template <> struct ResultType<Xerr> { using type = xerr_t; };
+template <> struct ResultType<Flag> { using type = bool; };
+// clang-format on
 
 template <uint32_t Code>
 struct Op {

@@ -8,8 +8,6 @@
 namespace hcall {
 namespace {
 
-constexpr char kSource[] = "Source/hcall/guest/HcallEnc";
-
 // Both constant-initialised and trivially destroyed, so they stay usable by a
 // thread that is still in an exchange while the process runs its exit-time
 // destructors.
@@ -31,7 +29,7 @@ uint8_t* Exchange::requestBuffer(const char* function, size_t requestLength, siz
     } else if (requestLength > UINT32_MAX) {
         // Beyond what the header can state; the client's own test could not
         // see the true length.
-        XLOG_AT(XLOG_MODULE_HCALL, XLOG_LEVEL_E, kSource, function,
+        XLOG_AT(XLOG_MODULE_HCALL, XLOG_LEVEL_E, kEncSource, function,
                 "%s: request of %zu bytes, mMaxHostBoundSize %u", function, requestLength,
                 client.mMaxHostBoundSize);
     } else {
@@ -39,7 +37,7 @@ uint8_t* Exchange::requestBuffer(const char* function, size_t requestLength, siz
         // A reply running past the guest-bound buffer would be read from
         // beyond the mapping.
         if (buffer && replyLength > client.mMaxGuestBoundSize) {
-            XLOG_AT(XLOG_MODULE_HCALL, XLOG_LEVEL_E, kSource, function,
+            XLOG_AT(XLOG_MODULE_HCALL, XLOG_LEVEL_E, kEncSource, function,
                     "%s: reply of %zu bytes, mMaxGuestBoundSize %u", function, replyLength,
                     client.mMaxGuestBoundSize);
             buffer = nullptr;

@@ -8,6 +8,9 @@
 
 namespace hcall {
 
+// The source path that every host-call log line names.
+inline constexpr char kEncSource[] = "Source/hcall/guest/HcallEnc";
+
 // Takes the connection's lock for its lifetime: the worker's calls and the
 // queries on Java threads share one pair of buffers and must never overlap.
 class Exchange {
