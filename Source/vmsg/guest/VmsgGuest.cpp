@@ -40,6 +40,9 @@ std::string serviceName(VmsgServiceId id) {
 bool VmsgGuestClient::connect(VmsgServiceId id) {
     VMSG_TRACE(kConnect, "called for %s\n", mServiceName.c_str());
     mServiceName = serviceName(id);
+    // Not connected until the new connection stands; an earlier one is the
+    // caller's to have released.
+    mFd = -1;
 
     VmsgFd fd(::open(VMSG_DEVICE_PATH, O_RDWR));
     if (fd.get() < 0) {
