@@ -33,6 +33,12 @@ final class ChildJvm {
     }
 
     static ChildJvm run(String scenario, Map<String, String> env, String... jvmOptions) {
+        return run(Scenarios.class.getName(), System.getProperty("java.class.path"), scenario, env, jvmOptions);
+    }
+
+    /** Runs `mainClass` with `classPath` and the single argument `scenario`. */
+    static ChildJvm run(String mainClass, String classPath, String scenario, Map<String, String> env,
+            String... jvmOptions) {
         List<String> command = new ArrayList<>();
         command.add(ProcessHandle.current().info().command().orElse("java"));
         command.add("-Xcheck:jni");
@@ -40,8 +46,8 @@ final class ChildJvm {
         command.add("-Dhostcall.lib=" + System.getProperty("hostcall.lib"));
         command.add("-Dhostcall.testlib=" + System.getProperty("hostcall.testlib"));
         command.add("-cp");
-        command.add(System.getProperty("java.class.path"));
-        command.add(Scenarios.class.getName());
+        command.add(classPath);
+        command.add(mainClass);
         command.add(scenario);
         try {
             Path log = Files.createTempFile("bridge-child-", ".out");
