@@ -45,6 +45,7 @@ final class ChildJvm {
         command.addAll(List.of(jvmOptions));
         command.add("-Dhostcall.lib=" + System.getProperty("hostcall.lib"));
         command.add("-Dhostcall.testlib=" + System.getProperty("hostcall.testlib"));
+        command.add("-Dhostcall.exitgate=" + System.getProperty("hostcall.exitgate"));
         command.add("-cp");
         command.add(classPath);
         command.add(mainClass);

@@ -205,13 +205,14 @@ public final class Scenarios {
     }
 
     static void exit(boolean busy, boolean viaSystemExit) {
+        ExitGate.load();
         KivHostCallService s = Bridge.started();
         s.native_onOrientationChange(1);
         Bridge.drain(s, true);
         if (busy) {
-            TestNative.holdHost(12);
+            ExitGate.holdUntilExit(12);
             s.native_onLocaleChanged("held");
-            check(TestNative.awaitHostHeld(Bridge.WORKER_TOLERANCE.toMillis()), "the worker reached the host");
+            check(ExitGate.awaitHeld(Bridge.WORKER_TOLERANCE.toMillis()), "the worker reached the host");
             s.native_setClipboardText("queued behind the held call");
             result("held", true);
         }
