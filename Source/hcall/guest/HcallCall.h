@@ -184,7 +184,6 @@ typename Op<Code>::Result call(const Args& args, std::index_sequence<I...> seq) 
 
     constexpr Result kResult = O::info.result;
     typename O::Result result = refusedResult<kResult>();
-    int reported = int(result);
     if (!lengthsValid) {
         XLOG_AT(XLOG_MODULE_HCALL, XLOG_LEVEL_E, kEncSource, op.signature,
                 "%s: negative buffer length", op.signature);
@@ -202,6 +201,7 @@ typename Op<Code>::Result call(const Args& args, std::index_sequence<I...> seq) 
             reply = exchange.send(request, uint32_t(requestLength));
         }
         if (reply) {
+            int reported = 0;
             (decodeField<O::template kind<I>>(reply, std::get<I>(args),
                                               bufferLengthAt<Code, I>(args)),
              ...);
@@ -212,10 +212,11 @@ typename Op<Code>::Result call(const Args& args, std::index_sequence<I...> seq) 
                 std::memcpy(&result, reply, sizeof(result));
                 reported = result;
             }
+            // A refused or failed exchange writes nothing more: only a reply
+            // gets its exit line.
+            logCall<Code>(XLOG_LEVEL_D, __LINE__, args, seq, reported);
         }
     }
-
-    logCall<Code>(XLOG_LEVEL_D, __LINE__, args, seq, reported);
     return result;
 }
 
