@@ -9,6 +9,7 @@ packages=(
   openjdk-17-jdk-headless junit5
   android-liblog-dev android-libnativehelper-dev android-libcutils-dev
   util-linux
+  blueprint-tools clang-tidy
 )
 
 missing=()
