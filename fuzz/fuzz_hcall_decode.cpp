@@ -1,0 +1,154 @@
+// The host's decoder fed any bytes: a request (as long as its totalLength
+// says, or all of the input) followed by a reply. Checked against a reading of
+// the wire rules written here, at capacities around the request's own sizes;
+// the hex helpers of the decode tool get the same bytes as text.
+#include <algorithm>
+#include <cctype>
+#include <cstring>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "FuzzCheck.h"
+#include "HcallDecoder.h"
+
+namespace {
+
+using fuzz::expect;
+using fuzz::le32;
+
+// Bytes in an allocation of exactly their size, so ASan sees any read past it.
+struct Exact {
+    Exact(const uint8_t* data, size_t size) : bytes(new uint8_t[size]), size(size) {
+        if (size != 0) std::memcpy(bytes.get(), data, size);
+    }
+    std::unique_ptr<uint8_t[]> bytes;
+    size_t size;
+};
+
+struct Reading {
+    bool wellFormed = false;
+    uint64_t replySize = 0;
+    int numFilled = 0;
+};
+
+// The wire rules: a known code; totalLength from the header to within what
+// arrived and the host-bound capacity; each field whole; a string's count
+// covering its bytes and one NUL that ends them; bools 0 or 1; filled sizes 4
+// and 8; a buffer's capacity not negative and equal to the length after it;
+// the fields ending exactly at totalLength; the reply within the guest-bound
+// capacity.
+Reading readByRules(const uint8_t* req, size_t len, uint32_t hostCap, uint32_t guestCap) {
+    Reading r;
+    if (len < 8) return r;
+    const hcall::OpInfo* op = hcall::findOp(le32(req));
+    const uint32_t total = le32(req + 4);
+    if (op == nullptr || total < 8 || total > len || (hostCap != 0 && total > hostCap)) return r;
+    uint64_t pos = 8;
+    uint32_t words[hcall::kMaxParams] = {};
+    uint64_t reply = 4;
+    for (int i = 0; i < op->numParams; ++i) {
+        if (pos + 4 > total) return r;
+        const uint32_t w = words[i] = le32(req + pos);
+        pos += 4;
+        switch (op->params[i]) {
+            case hcall::Str:
+                if (w == 0 || pos + w > total || req[pos + w - 1] != 0) return r;
+                for (uint32_t k = 0; k + 1 < w; ++k)
+                    if (req[pos + k] == 0) return r;
+                pos += w;
+                break;
+            case hcall::Bool:
+                if (w > 1) return r;
+                break;
+            case hcall::I32:
+                break;
+            case hcall::Buf:
+                if (w > 0x7FFFFFFF) return r;
+                reply += w;
+                ++r.numFilled;
+                break;
+            case hcall::OutI32:
+            case hcall::OutU64:
+                if (w != (op->params[i] == hcall::OutI32 ? 4u : 8u)) return r;
+                reply += w;
+                ++r.numFilled;
+                break;
+        }
+    }
+    if (pos != total) return r;
+    for (int i = 0; i + 1 < op->numParams; ++i)
+        if (op->params[i] == hcall::Buf && words[i + 1] != words[i]) return r;
+    if (guestCap != 0 && reply > guestCap) return r;
+    r.wellFormed = true;
+    r.replySize = reply;
+    return r;
+}
+
+bool endsWith(const std::string& s, const std::string& tail) {
+    return s.size() >= tail.size() && s.compare(s.size() - tail.size(), tail.size(), tail) == 0;
+}
+
+// One decoding, against the rules; the answer shown when a reply was given.
+Reading decodeAt(const Exact& req, const Exact* reply, uint32_t hostCap, uint32_t guestCap) {
+    const Reading want = readByRules(req.bytes.get(), req.size, hostCap, guestCap);
+    const HcallDecoded d =
+        hcallDecode(req.bytes.get(), req.size, reply ? reply->bytes.get() : nullptr,
+                    reply ? reply->size : 0, hostCap, guestCap);
+    const HcallDecoded c = hcallCheck(req.bytes.get(), req.size, hostCap, guestCap);
+    expect(d.wellFormed == want.wellFormed, "the decoder accepts exactly what the rules allow");
+    expect(c.wellFormed == d.wellFormed && c.problem == d.problem, "check and decode agree");
+    expect(d.wellFormed == d.problem.empty(), "a rejected request says why");
+    expect(!d.text.empty(), "every request gets a line");
+    if (!d.wellFormed) return want;
+    expect(d.replySize == want.replySize && d.numFilled == want.numFilled,
+           "the reply's size is the filled sizes and the result");
+    if (reply == nullptr) return want;
+    if (reply->size < d.replySize) {
+        expect(d.text.find(" -> !short reply: ") != std::string::npos, "a short reply is told");
+    } else {
+        const uint8_t* result = reply->bytes.get() + d.replySize - 4;
+        const std::string shown = d.op->result == hcall::Flag
+                                      ? (result[0] ? " -> true" : " -> false")
+                                      : " -> " + std::to_string(int32_t(le32(result)));
+        expect(endsWith(d.text, shown), "the answer shown is the reply's last word");
+    }
+    return want;
+}
+
+void checkHex(const uint8_t* data, size_t size) {
+    const std::string text(reinterpret_cast<const char*>(data), size);
+    std::vector<uint8_t> bytes;
+    if (hcallParseHex(text, bytes)) {
+        std::string digits;
+        for (char ch : text)
+            if (ch != ' ' && ch != '\t' && ch != ',') digits += char(std::tolower(uint8_t(ch)));
+        expect(hcallHex(bytes.data(), bytes.size()) == digits, "hex reads back as written");
+    }
+    expect(hcallParseHex(hcallHex(data, size), bytes) &&
+               bytes == std::vector<uint8_t>(data, data + size),
+           "any bytes survive hex and back");
+}
+
+}  // namespace
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
+    size_t requestLen = size;
+    if (size >= 8) requestLen = std::min<size_t>(size, le32(data + 4));
+    const Exact request(data, requestLen);
+    const Exact reply(data + requestLen, size - requestLen);
+    const Exact whole(data, size);
+
+    const Reading open = decodeAt(request, &reply, 0, 0);
+    decodeAt(whole, nullptr, 0, 0);
+    if (open.wellFormed) {
+        const uint32_t total = le32(data + 4);
+        const auto replySize = uint32_t(open.replySize);
+        expect(decodeAt(request, &reply, total, replySize).wellFormed, "exact capacities do");
+        expect(!decodeAt(request, nullptr, total - 1, 0).wellFormed, "one byte less of room fails");
+        expect(!decodeAt(request, nullptr, 0, replySize - 1).wellFormed,
+               "one byte less of reply room fails");
+    }
+    checkHex(data, size);
+    return 0;
+}

@@ -1,0 +1,34 @@
+#!/usr/bin/env bash
+# Runs every fuzz target of a fuzz build for a bounded time, each on a working
+# copy of its seed corpus, and fails when any of them finds a crash, a failed
+# expectation or a hang. The working corpus and any crashing input stay in
+# BUILD_DIR/fuzz-work/<target>/.
+# Usage: fuzz/run-fuzz.sh BUILD_DIR [SECONDS_PER_TARGET]
+set -euo pipefail
+build=${1:?usage: run-fuzz.sh BUILD_DIR [SECONDS_PER_TARGET]}
+seconds=${2:-60}
+seeds=$(cd "$(dirname "$0")" && pwd)/corpus
+
+targets=(fuzz_hcall_decode fuzz_guest_reply fuzz_level_split fuzz_request_roundtrip)
+passed=0
+failed=0
+for target in "${targets[@]}"; do
+  work=$build/fuzz-work/$target
+  mkdir -p "$work/corpus" "$work/artifacts"
+  # Seeds join what earlier runs found; the repository's copy is never written.
+  cp -n "$seeds/$target"/* "$work/corpus/"
+  echo "== $target: ${seconds}s from $(ls "$work/corpus" | wc -l) inputs"
+  if HOSTCALL_TEST_KMSG=/dev/null UBSAN_OPTIONS=print_stacktrace=1:halt_on_error=1 \
+    "$build/bin/$target" -max_total_time="$seconds" -timeout=10 -rss_limit_mb=2048 \
+    -max_len=4096 -print_final_stats=1 -artifact_prefix="$work/artifacts/" \
+    "$work/corpus" >"$work/log" 2>&1; then
+    passed=$((passed + 1))
+    grep -E '^(Done|stat::number_of_executed_units|stat::peak_rss_mb)' "$work/log" || true
+  else
+    failed=$((failed + 1))
+    tail -n 60 "$work/log"
+    echo "!! $target failed; input kept in $work/artifacts/"
+  fi
+done
+echo "fuzz: $passed passed, $failed failed"
+[[ $failed -eq 0 ]]
