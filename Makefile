@@ -2,7 +2,7 @@
 JOBS ?= 2
 CMAKE_FLAGS ?=
 
-.PHONY: all deps build test asan tsan demo bench clean
+.PHONY: all deps build test asan tsan demo bench fuzz clean
 
 all: build
 
@@ -38,5 +38,14 @@ bench: build
 	HOSTCALL_TEST_KMSG=/dev/null build/bin/hcall_bench
 	bench/bridge/run-bench.sh build
 
+# Each fuzz target for FUZZ_SECONDS on its corpus (clang's libFuzzer); CI runs
+# `make fuzz FUZZ_SECONDS=20`.
+FUZZ_SECONDS ?= 60
+fuzz: deps
+	cmake -S . -B build-fuzz -DHOSTCALL_FUZZ=ON -DHOSTCALL_SANITIZE=address,undefined \
+	  -DCMAKE_C_COMPILER=clang -DCMAKE_CXX_COMPILER=clang++ $(CMAKE_FLAGS)
+	cmake --build build-fuzz -j $(JOBS) --target hostcall_fuzz
+	fuzz/run-fuzz.sh build-fuzz $(FUZZ_SECONDS)
+
 clean:
-	rm -rf build build-asan build-tsan
+	rm -rf build build-asan build-tsan build-fuzz
