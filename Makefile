@@ -2,7 +2,7 @@
 JOBS ?= 2
 CMAKE_FLAGS ?=
 
-.PHONY: all deps build test asan tsan demo bench fuzz clean
+.PHONY: all deps build test asan tsan demo bench soak fuzz clean
 
 all: build
 
@@ -37,6 +37,10 @@ demo: build
 bench: build
 	HOSTCALL_TEST_KMSG=/dev/null build/bin/hcall_bench
 	bench/bridge/run-bench.sh build
+
+# The service bridge's soak and exit proof at full size (make test runs them short).
+soak: build
+	HOSTCALL_SOAK_EVENTS=400000 HOSTCALL_SOAK_EXITS=50 ctest --test-dir build --output-on-failure -L soak
 
 # Each fuzz target for FUZZ_SECONDS on its corpus (clang's libFuzzer); CI runs
 # `make fuzz FUZZ_SECONDS=20`.

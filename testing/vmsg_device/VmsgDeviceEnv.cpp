@@ -11,6 +11,11 @@
 //   VMSG_DEVICE_PROPS=text  VMSG_DEVICE_PROPS_VALUE=n     filled data of operation 1
 //   VMSG_DEVICE_TIME=n      VMSG_DEVICE_TIME_TEXT=text    filled data of operation 5
 //   VMSG_DEVICE_DELAY_US=n         pause before each reply
+//   VMSG_DEVICE_DELAY_JITTER_US=n  a further random pause of 0 to n
+//   VMSG_DEVICE_FAIL_PER_MILLE=n   answer n of every 1000 exchanges, at random, with
+//   VMSG_DEVICE_FAIL_RESULT=n        this result (default 5)
+//   VMSG_DEVICE_SEND_FAIL_PER_MILLE=n  fail n of every 1000 SEND_RECEIVE with EIO
+//   VMSG_DEVICE_SEED=n             seed of those random choices (default 1)
 //   VMSG_DEVICE_FAIL=open|connect|mmap|send[:errno]   inject one failure
 //   VMSG_DEVICE_REPLY=short:n|garbage|raw:hex          replace the proper reply
 //   VMSG_DEVICE_TRACE=/path        append one line per exchange
@@ -155,6 +160,11 @@ VmsgDeviceScript scriptFromEnvironment() {
     });
     readText("VMSG_DEVICE_TIME_TEXT", s.timeText);
     readU32("VMSG_DEVICE_DELAY_US", s.delayUs);
+    readU32("VMSG_DEVICE_DELAY_JITTER_US", s.delayJitterUs);
+    readNumber("VMSG_DEVICE_FAIL_PER_MILLE", s.failurePerMille, 0, 1000);
+    readI32("VMSG_DEVICE_FAIL_RESULT", s.failureResult);
+    readNumber("VMSG_DEVICE_SEND_FAIL_PER_MILLE", s.sendFailurePerMille, 0, 1000);
+    readNumber("VMSG_DEVICE_SEED", s.randomSeed, 0, INT64_MAX);
     readVar("VMSG_DEVICE_FAIL", [&](const std::string& text) { return parseFail(text, s); });
     readVar("VMSG_DEVICE_REPLY", [&](const std::string& text) { return parseReply(text, s); });
     readText("VMSG_DEVICE_TRACE", s.tracePath);

@@ -98,11 +98,34 @@ struct Exchange {
     uint32_t requestLen = 0;
     uint32_t replyLen = 0;
     int sendErrno = 0;
+    uint32_t extraDelayUs = 0;  // drawn at random
+    bool failed = false;        // answered with the script's failure result
+};
+
+// splitmix64: small, fast, and the same sequence on every platform.
+class Random {
+  public:
+    void seed(uint64_t seed) { mState = seed; }
+    uint64_t next() {
+        uint64_t z = (mState += 0x9E3779B97F4A7C15ULL);
+        z = (z ^ (z >> 30)) * 0xBF58476D1CE4E5B9ULL;
+        z = (z ^ (z >> 27)) * 0x94D049BB133111EBULL;
+        return z ^ (z >> 31);
+    }
+    // Uniform enough in [0, bound] for pauses and shares.
+    uint32_t upTo(uint32_t bound) { return uint32_t(next() % (uint64_t(bound) + 1)); }
+    bool perMille(uint32_t share) { return share != 0 && upTo(999) < share; }
+
+  private:
+    uint64_t mState = 0;
 };
 
 class Device {
   public:
-    Device() : mScript(std::make_shared<VmsgDeviceScript>(scriptFromEnvironment())) { openTrace(); }
+    Device() : mScript(std::make_shared<VmsgDeviceScript>(scriptFromEnvironment())) {
+        mRandom.seed(mScript->randomSeed);
+        openTrace();
+    }
 
     static Device& get() {
         // Never destroyed: the client disconnects from static destructors
@@ -185,6 +208,7 @@ class Device {
         std::lock_guard<std::mutex> lock(mMutex);
         const bool traceChanged = script.tracePath != mScript->tracePath;
         mScript = std::make_shared<VmsgDeviceScript>(script);
+        mRandom.seed(script.randomSeed);
         if (traceChanged) openTrace();
     }
 
@@ -194,6 +218,7 @@ class Device {
         mExchanges.clear();
         mEvents.clear();
         mOverlaps = 0;
+        mServed = 0;
         mHook = nullptr;
     }
 
@@ -217,6 +242,10 @@ class Device {
         std::unique_lock<std::mutex> lock(mMutex);
         return mRecorded.wait_for(lock, std::chrono::milliseconds(timeoutMs),
                                   [&] { return mExchanges.size() >= count; });
+    }
+    uint64_t served() {
+        std::lock_guard<std::mutex> lock(mMutex);
+        return mServed;
     }
     size_t openCount() {
         std::lock_guard<std::mutex> lock(mMutex);
@@ -317,6 +346,10 @@ class Device {
         x.guestBoundCapacity = conn.guestBoundCapacity;
         x.seq = mSeq++;
         x.overlapped = ++conn.inFlight > 1;
+        const VmsgDeviceScript& s = *mScript;
+        if (s.delayJitterUs != 0) x.extraDelayUs = mRandom.upTo(s.delayJitterUs);
+        if (mRandom.perMille(s.sendFailurePerMille)) x.sendErrno = EIO;
+        x.failed = mRandom.perMille(s.failurePerMille);
         return 0;
     }
 
@@ -348,15 +381,16 @@ class Device {
         if (x.requestLen != 0) std::memcpy(taken, m.view, x.requestLen);
 
         bool rewritten = false;
-        if (x.script->sendErrno != 0) {
-            x.sendErrno = x.script->sendErrno;
-        } else {
+        if (x.script->sendErrno != 0) x.sendErrno = x.script->sendErrno;
+        if (x.sendErrno == 0) {
             const HcallDecoded d =
                 hcallCheck(taken, x.requestLen, x.hostBoundCapacity, x.guestBoundCapacity);
-            if (x.script->delayUs != 0) usleep(x.script->delayUs);
+            const uint32_t delayUs = x.script->delayUs + x.extraDelayUs;
+            if (delayUs != 0) usleep(delayUs);
             if (x.hook) x.hook(d.opCode);
             rewritten = x.requestLen != 0 && std::memcmp(taken, m.view, x.requestLen) != 0;
-            x.replyLen = writeReply(*x.script, d, m.view + m.guestOffset, m.replyBytes, x.seq);
+            x.replyLen =
+                writeReply(*x.script, d, m.view + m.guestOffset, m.replyBytes, x.seq, x.failed);
         }
         finish(x, taken, rewritten);
         return x.sendErrno != 0 ? fail(x.sendErrno) : 0;
@@ -368,6 +402,7 @@ class Device {
         if (it != mConnections.end() && it->second.memory == x.memory) --it->second.inFlight;
         const bool overlapped = x.overlapped || rewritten;
         if (overlapped) ++mOverlaps;
+        ++mServed;
         const VmsgDeviceScript& s = *x.script;
         if (!s.record && mTraceFd < 0 && !s.printCalls && !overlapped) return;
 
@@ -436,7 +471,9 @@ class Device {
     std::vector<VmsgDeviceExchange> mExchanges;
     std::vector<VmsgDeviceEvent> mEvents;
     size_t mOverlaps = 0;
+    uint64_t mServed = 0;
     uint64_t mSeq = 0;
+    Random mRandom;
     std::function<void(uint32_t)> mHook;
     int mTraceFd = -1;
 };
@@ -474,6 +511,7 @@ bool vmsgDeviceWaitForExchanges(size_t count, uint32_t timeoutMs) {
     return vmsgdev::Device::get().waitForExchanges(count, timeoutMs);
 }
 size_t vmsgDeviceOpenCount() { return vmsgdev::Device::get().openCount(); }
+uint64_t vmsgDeviceServedCount() { return vmsgdev::Device::get().served(); }
 void vmsgDeviceSetHostHook(std::function<void(uint32_t)> hook) {
     vmsgdev::Device::get().setHook(std::move(hook));
 }

@@ -72,6 +72,18 @@ struct VmsgDeviceScript {
     // Pause inside SEND_RECEIVE before the reply is written.
     uint32_t delayUs = 0;
 
+    // A host that is slow and unreliable at random, reproducibly: every
+    // exchange draws from a generator seeded with randomSeed whenever a script
+    // is configured. It pauses a further 0 to delayJitterUs microseconds
+    // (uniformly); failurePerMille of the exchanges are answered with
+    // failureResult (a flag operation with false) instead of their result, and
+    // sendFailurePerMille of them fail SEND_RECEIVE itself with EIO.
+    uint32_t delayJitterUs = 0;
+    uint32_t failurePerMille = 0;
+    int32_t failureResult = 5;  // XERR_IO
+    uint32_t sendFailurePerMille = 0;
+    uint64_t randomSeed = 1;
+
     VmsgDeviceReplyMode replyMode = VmsgDeviceReplyMode::Scripted;
     uint32_t shortReplyBytes = 0;
     std::vector<uint8_t> rawReply;
@@ -130,6 +142,10 @@ VMSG_DEVICE_API size_t vmsgDeviceOverlapCount();
 VMSG_DEVICE_API bool vmsgDeviceWaitForExchanges(size_t count, uint32_t timeoutMs);
 // Device descriptors currently open.
 VMSG_DEVICE_API size_t vmsgDeviceOpenCount();
+// SEND_RECEIVE requests that reached the host (served or failed) since the
+// last reset. Counted whether or not exchanges are recorded, so a long run
+// can pace itself on it without the model growing.
+VMSG_DEVICE_API uint64_t vmsgDeviceServedCount();
 
 // Called inside every SEND_RECEIVE after the request was taken and before the
 // reply is written, outside the model's locks, with the operation code. Lets a

@@ -45,14 +45,15 @@ class ReplyWriter {
     size_t mPos = 0;
 };
 
-int32_t resultFor(const VmsgDeviceScript& s, const hcall::OpInfo& op) {
+int32_t resultFor(const VmsgDeviceScript& s, const hcall::OpInfo& op, bool failed) {
+    if (failed) return op.result == hcall::Flag ? 0 : s.failureResult;
     const auto it = s.results.find(op.code);
     if (it != s.results.end()) return it->second;
     if (op.result == hcall::Flag) return s.launchAllowed ? 1 : 0;
     return s.defaultResult;
 }
 
-void writeScripted(const VmsgDeviceScript& s, const HcallDecoded& d, ReplyWriter& w) {
+void writeScripted(const VmsgDeviceScript& s, const HcallDecoded& d, bool failed, ReplyWriter& w) {
     if (!d.wellFormed) {
         w.u32(uint32_t(s.malformedResult));
         return;
@@ -63,7 +64,7 @@ void writeScripted(const VmsgDeviceScript& s, const HcallDecoded& d, ReplyWriter
         if (f.kind == hcall::OutU64) w.u64(s.timeValue);
         if (f.kind == hcall::Buf) w.text(d.opCode == 1 ? s.propsText : s.timeText, f.size);
     }
-    w.u32(uint32_t(resultFor(s, *d.op)));
+    w.u32(uint32_t(resultFor(s, *d.op, failed)));
 }
 
 uint32_t writeGarbage(uint8_t* out, uint32_t capacity, uint64_t seed) {
@@ -80,7 +81,7 @@ uint32_t writeGarbage(uint8_t* out, uint32_t capacity, uint64_t seed) {
 }  // namespace
 
 uint32_t writeReply(const VmsgDeviceScript& script, const HcallDecoded& request, uint8_t* out,
-                    uint32_t capacity, uint64_t seed) {
+                    uint32_t capacity, uint64_t seed, bool failed) {
     switch (script.replyMode) {
         case VmsgDeviceReplyMode::Garbage:
             return writeGarbage(out, capacity, seed);
@@ -95,7 +96,7 @@ uint32_t writeReply(const VmsgDeviceScript& script, const HcallDecoded& request,
     }
     const bool cut = script.replyMode == VmsgDeviceReplyMode::Short;
     ReplyWriter w(out, cut ? std::min(capacity, script.shortReplyBytes) : capacity);
-    writeScripted(script, request, w);
+    writeScripted(script, request, failed, w);
     return w.written();
 }
 

@@ -10,8 +10,9 @@ namespace vmsgdev {
 
 // Writes the reply that the script asks for into out (capacity bytes of
 // guest-bound buffer) and returns how many bytes it wrote from the start.
-// seed varies the garbage pattern between exchanges.
+// seed varies the garbage pattern between exchanges; failed answers the
+// script's failureResult (false for a flag) in place of the result.
 uint32_t writeReply(const VmsgDeviceScript& script, const HcallDecoded& request, uint8_t* out,
-                    uint32_t capacity, uint64_t seed);
+                    uint32_t capacity, uint64_t seed, bool failed = false);
 
 }  // namespace vmsgdev
