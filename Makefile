@@ -2,7 +2,7 @@
 JOBS ?= 2
 CMAKE_FLAGS ?=
 
-.PHONY: all deps build test asan tsan demo bench soak fuzz clean
+.PHONY: all deps build test asan tsan demo bench soak fuzz lint clean
 
 all: build
 
@@ -50,6 +50,13 @@ fuzz: deps
 	  -DCMAKE_C_COMPILER=clang -DCMAKE_CXX_COMPILER=clang++ $(CMAKE_FLAGS)
 	cmake --build build-fuzz -j $(JOBS) --target hostcall_fuzz
 	fuzz/run-fuzz.sh build-fuzz $(FUZZ_SECONDS)
+
+# The shipped library as the platform build takes it: Android.bp parses, is
+# formatted and lists the CMake sources; clang-tidy runs clean over the library.
+lint: deps
+	tools/lint/check-android-bp.sh
+	cmake -S . -B build -DCMAKE_EXPORT_COMPILE_COMMANDS=ON $(CMAKE_FLAGS)
+	tools/lint/run-clang-tidy.sh build $(JOBS)
 
 clean:
 	rm -rf build build-asan build-tsan build-fuzz

@@ -24,6 +24,8 @@ static_assert(sizeof(kNamedCodes) / sizeof(kNamedCodes[0]) == 131,
               "every Linux error number from 1 to 133 except 41 and 58 has a name");
 
 constexpr bool namedCodesFitTables() {
+    // A loop, not std::all_of: the algorithms are constexpr only from C++20.
+    // NOLINTNEXTLINE(readability-use-anyofallof)
     for (const NamedCode& row : kNamedCodes) {
         if (row.code <= 0 || row.code >= XERR_XLAT_TABLE_SIZE || row.code == 41 || row.code == 58) {
             return false;
@@ -61,12 +63,12 @@ std::string xerrStr(xerr_t err) {
     }
     char text[160];
     if (err <= XERR_NATIVE_BASE) {
-        std::snprintf(text, sizeof(text), "NOTDEFINED: %d", err);
+        (void)std::snprintf(text, sizeof(text), "NOTDEFINED: %d", err);
     } else {
         // The GNU strerror_r never shares a buffer with other threads.
         char nativeText[128];
         const char* reason = strerror_r(err - XERR_NATIVE_BASE, nativeText, sizeof(nativeText));
-        std::snprintf(text, sizeof(text), "NOTDEFINED: %d %s", err, reason);
+        (void)std::snprintf(text, sizeof(text), "NOTDEFINED: %d %s", err, reason);
     }
     return text;
 }

@@ -31,7 +31,7 @@ XlogState* createState() {
     // Value-initialised: empty strings, null tags, every level 0 (only E
     // passes), all flags false. Never freed, so that threads still logging
     // while the process exits find it intact.
-    XlogState* state = new XlogState();
+    auto* state = new XlogState();
     state->logger.shouldLog = xlogShouldLog;
     state->logger.print = xlogPrint;
     return state;
@@ -71,9 +71,9 @@ void xlogPrint(int level, int module, const char* /*file*/, const char* /*functi
         // Android log still receives the untouched argument list.
         va_list kmsgArgs;
         va_copy(kmsgArgs, args);
-        std::vfprintf(kmsg, format, kmsgArgs);
+        (void)std::vfprintf(kmsg, format, kmsgArgs);
         va_end(kmsgArgs);
-        std::fflush(kmsg);
+        (void)std::fflush(kmsg);
     }
     const char* tag = isModule(module) ? xlogState()->modules[module].tag : nullptr;
     __android_log_vprint(priorityOf(level), tag, format, args);

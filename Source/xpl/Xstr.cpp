@@ -11,12 +11,12 @@ namespace {
 // char value, so bytes 0x80 to 0xFF order before every ASCII character and
 // before the end of the other string, whatever the C library's locale says.
 int foldLower(char c) {
-    signed char value = static_cast<signed char>(c);
+    auto value = static_cast<signed char>(c);
     return value >= 'A' && value <= 'Z' ? value - 'A' + 'a' : value;
 }
 
 int foldUpper(char c) {
-    signed char value = static_cast<signed char>(c);
+    auto value = static_cast<signed char>(c);
     return value >= 'a' && value <= 'z' ? value - 'a' + 'A' : value;
 }
 
@@ -96,7 +96,7 @@ std::string xstrPrintf(const char* fmt, ...) {
     if (length > 0) {
         out.resize(static_cast<size_t>(length));
         // The terminator lands on the string's own terminating slot.
-        std::vsnprintf(&out[0], out.size() + 1, fmt, args);
+        (void)std::vsnprintf(out.data(), out.size() + 1, fmt, args);
     }
     va_end(args);
     return out;

@@ -27,7 +27,7 @@ long long xtimeNow() {
 
 long long xtimeToUtc(long long t) {
     long long secs = t / kMicrosPerSecond;
-    time_t seconds = static_cast<time_t>(secs);
+    auto seconds = static_cast<time_t>(secs);
     struct tm broken {};
     gmtime_r(&seconds, &broken);
     // Read as standard time: the base holds no daylight-saving flag.
@@ -37,7 +37,7 @@ long long xtimeToUtc(long long t) {
 }
 
 size_t xtimeStrf(char* buf, size_t size, const char* fmt, long long t) {
-    time_t seconds = static_cast<time_t>(t / kMicrosPerSecond);
+    auto seconds = static_cast<time_t>(t / kMicrosPerSecond);
     struct tm broken {};
     gmtime_r(&seconds, &broken);
     return strftime(buf, size, fmt, &broken);

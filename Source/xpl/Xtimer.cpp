@@ -18,7 +18,7 @@ constexpr long long kMaxWaitUs = 10LL * 366 * 24 * 3600 * 1000000;
 // another file's static initialiser finds the record whatever the order of
 // initialisation. Never freed: the timer thread may run during exit.
 XtimerGlobals* timerGlobals() {
-    static XtimerGlobals* const globals = new XtimerGlobals();
+    static auto* const globals = new XtimerGlobals();
     return globals;
 }
 

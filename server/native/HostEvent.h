@@ -104,13 +104,13 @@ std::tuple<> loggedValue(const Unlogged<T>&) {
 
 // The printf conversion each stored type is shown with; '-' for none.
 template <typename T>
-constexpr char kConversion = '-';
+inline constexpr char kConversion = '-';
 template <>
-constexpr char kConversion<std::string> = 's';
+inline constexpr char kConversion<std::string> = 's';
 template <>
-constexpr char kConversion<jboolean> = 'd';
+inline constexpr char kConversion<jboolean> = 'd';
 template <>
-constexpr char kConversion<jint> = 'd';
+inline constexpr char kConversion<jint> = 'd';
 
 // True when `format` holds exactly the conversions in `expected` ('-' skipped).
 constexpr bool formatMatches(const char* format, const char* expected) {

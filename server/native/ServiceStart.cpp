@@ -54,7 +54,7 @@ bool bringUp() {
     if (!gStart.supportStarted) {
         xerr_t err = xplLibInit(nullptr, std::string());
         if (err != XERR_SUCCESS) {
-            fprintf(stderr, "%s: xplLibInit failed. err = %d\n", kInitName, err);
+            (void)fprintf(stderr, "%s: xplLibInit failed. err = %d\n", kInitName, err);
             __android_log_print(ANDROID_LOG_ERROR, kBridgeLogTag,
                                 "%s: xplLibInit failed. err = %d\n", kInitName, err);
             return false;
@@ -78,6 +78,8 @@ void readDebugSwitch() {
     char value[PROPERTY_VALUE_MAX];
     property_get(kDebugProperty, value, "0");
     // Only ever switched on: a later "0" leaves an earlier "on" in force.
+    // atoi on purpose: anything that does not read as a number is 0, i.e. off.
+    // NOLINTNEXTLINE(cert-err34-c)
     if (atoi(value) != 0) g_debug_enabled.store(true, std::memory_order_relaxed);
 }
 
