@@ -20,13 +20,13 @@ if [[ -n "$layout" ]]; then
     status=1
 fi
 
-# The .cpp entries of each archive's add_library(... STATIC ...) list, with
-# the folder in front.
+# The .cpp entries of each archive's add_library(... STATIC ...) list and of
+# any target_sources(...), with the folder in front.
 cmake_sources() {
     local dir
     for dir in "${archives[@]}"; do
         awk -v dir="$dir" '
-            /add_library\([A-Za-z_]+ STATIC/ { inlist = 1 }
+            /add_library\([A-Za-z_]+ STATIC|target_sources\(/ { inlist = 1 }
             inlist {
                 for (i = 1; i <= NF; i++)
                     if ($i ~ /\.cpp\)?$/) { f = $i; sub(/\)$/, "", f); print dir "/" f }
