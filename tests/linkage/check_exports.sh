@@ -4,6 +4,7 @@
 # where it gives a signature, with exactly the listed parameter types, and
 # nothing besides. Usage: check_exports.sh LIBRARY LIST
 set -euo pipefail
+export LC_ALL=C  # one collation for sort and comm
 lib=$1
 list=$2
 work=$(mktemp -d)
