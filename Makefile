@@ -35,8 +35,7 @@ demo: build
 
 # Figures only: nothing here passes or fails on time.
 bench: build
-	HOSTCALL_TEST_KMSG=/dev/null build/bin/hcall_bench
-	bench/bridge/run-bench.sh build
+	bench/run-bench.sh build
 
 # The service bridge's soak and exit proof at full size (make test runs them short).
 soak: build

@@ -5,7 +5,7 @@ set -euo pipefail
 
 packages=(
   cmake make g++ clang libclang-rt-14-dev
-  libgtest-dev libgmock-dev libbenchmark-dev
+  libgtest-dev libgmock-dev libbenchmark-dev libboost-dev
   openjdk-17-jdk-headless junit5
   android-liblog-dev android-libnativehelper-dev android-libcutils-dev
   util-linux

@@ -114,6 +114,16 @@ JNIEXPORT jint JNICALL Java_com_zelvane_server_bench_BenchNative_floorInt(JNIEnv
     return 0;
 }
 
+// The floor with the value kept as the bridge keeps its copies, in a
+// std::tuple: a tuple is not trivially copyable, so std::function stores the
+// task on the heap rather than inside itself.
+JNIEXPORT jint JNICALL Java_com_zelvane_server_bench_BenchNative_floorIntTuple(JNIEnv*, jclass,
+                                                                               jint v) {
+    std::tuple<jint> values{v};
+    gFloor->push([values] { gSink = std::get<0>(values); });
+    return 0;
+}
+
 JNIEXPORT jint JNICALL Java_com_zelvane_server_bench_BenchNative_floorString(JNIEnv* env, jclass,
                                                                              jstring s) {
     std::string bytes = convert(env, s);

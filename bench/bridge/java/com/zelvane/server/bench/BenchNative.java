@@ -9,6 +9,8 @@ final class BenchNative {
     static native int bareInstall(String p, String a, String l, int vc, String vn, String i, String s, boolean u);
 
     static native int floorInt(int v);
+    /** floorInt keeping its copy in a std::tuple, as the bridge does. */
+    static native int floorIntTuple(int v);
     static native int floorString(String s);
     static native int floorInstall(String p, String a, String l, int vc, String vn, String i, String s, boolean u);
 

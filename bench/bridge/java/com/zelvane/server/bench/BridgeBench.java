@@ -10,12 +10,15 @@ import java.util.function.LongSupplier;
 /**
  * Java-side cost of the forwarding methods beside two floors measured in the
  * same run, and events per second end to end through the device model.
- * Prints figures only; it asserts nothing.
+ * Prints rows of the merged table (bench/common/BenchRow.h); it asserts
+ * nothing.
  */
 public final class BridgeBench {
-    static final int CALLS = 20_000;
-    static final int WARM_ROUNDS = 5;
-    static final int ROUNDS = 15;
+    // Short rounds, many of them: a round that lost the processor to another
+    // process on this shared machine is an outlier the median ignores.
+    static final int CALLS = 2_000;
+    static final int WARM_ROUNDS = 10;
+    static final int ROUNDS = 61;
     static final int END_TO_END_EVENTS = 40_000;
 
     static final String PKG = "com.example.notes";
@@ -64,20 +67,43 @@ public final class BridgeBench {
         }
     }
 
-    static void row(String name, IntUnaryOperator bridge, IntUnaryOperator bare, IntUnaryOperator floor)
-            throws InterruptedException {
+    /** One line of the merged table (bench/common/BenchRow.h describes the fields). */
+    static void printRow(String area, String figure, double value, String unit, String beside, double besideValue,
+            String target) {
+        boolean compared = !beside.equals("-") && besideValue > 0;
+        System.out.printf("row\t%s\t%s\t%.6g\t%s\t%s\t%s\t%s\t%s%n", area, figure, value, unit, beside,
+                compared ? String.format("%.6g", besideValue) : "-",
+                compared ? String.format("%.2f", value / besideValue) : "-", target);
+    }
+
+    /** Medians of interleaved rounds, each round started by another contender. */
+    static void interleave(List<Contender> all) throws InterruptedException {
+        for (int r = 0; r < WARM_ROUNDS + ROUNDS; r++) {
+            for (int k = 0; k < all.size(); k++) {
+                double ns = all.get((r + k) % all.size()).round();
+                if (r >= WARM_ROUNDS) all.get((r + k) % all.size()).rounds[r - WARM_ROUNDS] = ns;
+            }
+        }
+    }
+
+    /**
+     * The bridge beside the bare call and the design floor; `tupleFloor`, when
+     * not null, is the floor keeping its copies as the bridge does.
+     */
+    static void row(String name, IntUnaryOperator bridge, IntUnaryOperator bare, IntUnaryOperator floor,
+            IntUnaryOperator tupleFloor) throws InterruptedException {
         Contender b = new Contender(bridge, BenchNative::hostCalls);
         Contender c = new Contender(bare, null);
         Contender f = new Contender(floor, BenchNative::floorDone);
-        // Interleaved rounds, so drift in the machine affects all three alike.
-        for (int r = 0; r < WARM_ROUNDS + ROUNDS; r++) {
-            for (Contender k : List.of(b, c, f)) {
-                double ns = k.round();
-                if (r >= WARM_ROUNDS) k.rounds[r - WARM_ROUNDS] = ns;
-            }
+        Contender t = tupleFloor == null ? null : new Contender(tupleFloor, BenchNative::floorDone);
+        // Drift in the machine affects every contender alike.
+        interleave(t == null ? List.of(b, c, f) : List.of(b, c, f, t));
+        printRow("JNI layer", name + ", Java side", b.median(), "ns", "design floor", f.median(), "<=1.20");
+        printRow("JNI layer", name + ", Java side", b.median(), "ns", "bare JNI, same conversions", c.median(), "-");
+        if (t != null) {
+            printRow("JNI layer", name + ", Java side", b.median(), "ns", "design floor, copies in a std::tuple",
+                    t.median(), "-");
         }
-        System.out.printf("%-22s %10.0f %12.0f %14.0f %12.2fx %12.2fx%n", name, b.median(), c.median(), f.median(),
-                b.median() / c.median(), b.median() / f.median());
     }
 
     static double eventsPerSecond(KivHostCallService s, int threads) throws InterruptedException {
@@ -102,23 +128,23 @@ public final class BridgeBench {
         KivHostCallService s = new KivHostCallService();
         s.native_init();
 
-        System.out.println("Java-side cost of a forwarding call, ns per call (median of " + ROUNDS + " rounds of "
-                + CALLS + " calls)");
-        System.out.printf("%-22s %10s %12s %14s %13s %13s%n", "method", "bridge", "bare JNI", "design floor",
-                "vs bare", "vs floor");
-        row("onOrientationChange", i -> s.native_onOrientationChange(i), BenchNative::bareInt, BenchNative::floorInt);
+        row("onOrientationChange", i -> s.native_onOrientationChange(i), BenchNative::bareInt, BenchNative::floorInt,
+                BenchNative::floorIntTuple);
         row("onLocaleChanged", i -> s.native_onLocaleChanged(LOCALE), i -> BenchNative.bareString(LOCALE),
-                i -> BenchNative.floorString(LOCALE));
+                i -> BenchNative.floorString(LOCALE), null);
         row("onAppInstalled", i -> s.native_onAppInstalled(PKG, ACTIVITY, "Notes", i, "4.2", "icon.png", "store", false),
                 i -> BenchNative.bareInstall(PKG, ACTIVITY, "Notes", i, "4.2", "icon.png", "store", false),
-                i -> BenchNative.floorInstall(PKG, ACTIVITY, "Notes", i, "4.2", "icon.png", "store", false));
-        System.out.println("bare JNI: the same call converting its strings and nothing else;");
-        System.out.println("design floor: conversions, one std::function holding the copies, one locked push and");
-        System.out.println("its notification. Target: the bridge at most 1.20x the design floor.");
-        System.out.println();
-        System.out.printf("end to end through the device model: %.0f events/s with 1 Java thread%n",
-                eventsPerSecond(s, 1));
-        System.out.printf("end to end through the device model: %.0f events/s with 4 Java threads%n",
-                eventsPerSecond(s, 4));
+                i -> BenchNative.floorInstall(PKG, ACTIVITY, "Notes", i, "4.2", "icon.png", "store", false), null);
+        // Measured once the calls above have warmed the compiler.
+        Contender empty = new Contender(i -> BenchNative.bareInt(i), null);
+        interleave(List.of(empty));
+        printRow("floors", "bare empty JNI call", empty.median(), "ns", "-", 0, "-");
+        for (int threads : new int[] {1, 4}) {
+            double[] runs = new double[5];
+            for (int r = 0; r < runs.length; r++) runs[r] = eventsPerSecond(s, threads);
+            Arrays.sort(runs);
+            printRow("JNI layer", "events end to end, " + threads + " Java thread(s)", runs[runs.length / 2],
+                    "events/s", "-", 0, "-");
+        }
     }
 }
