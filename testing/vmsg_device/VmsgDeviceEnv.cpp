@@ -3,8 +3,9 @@
 //   VMSG_DEVICE_CAPACITY=n         both buffer capacities (default 65536)
 //   VMSG_DEVICE_HOST_CAPACITY=n    host-bound capacity alone
 //   VMSG_DEVICE_GUEST_CAPACITY=n   guest-bound capacity alone
-//   VMSG_DEVICE_GUEST_OFFSET=n     guest-bound offset (default: after the host-bound buffer,
-//   page-rounded) VMSG_DEVICE_SPARE=n            the spare out-word of CONNECT
+//   VMSG_DEVICE_GUEST_OFFSET=n     guest-bound offset (default: after the host-bound
+//                                  buffer, page-rounded)
+//   VMSG_DEVICE_SPARE=n            the spare out-word of CONNECT
 //   VMSG_DEVICE_RESULTS=12=-5,24=0 result per operation code
 //   VMSG_DEVICE_DEFAULT_RESULT=n   result of every other operation (default 0)
 //   VMSG_DEVICE_LAUNCH_ALLOWED=0|1 answer of operation 24 unless RESULTS names it (default 1)
