@@ -4,6 +4,8 @@
 
 #include <cstdarg>
 #include <cstdio>
+#include <cstring>
+#include <string>
 
 #include "xpl/Xlog.h"
 
@@ -11,7 +13,11 @@ namespace fuzz {
 
 inline int wantEveryLine(int /*module*/, int /*level*/) { return 1; }
 
-__attribute__((format(printf, 6, 7))) inline void formatAndDrop(int /*level*/, int /*module*/,
+// The host-call exit lines ("returning [%d] from ..."), counted, and the last.
+inline int g_exitLines = 0;
+inline std::string g_lastExitLine;
+
+__attribute__((format(printf, 6, 7))) inline void formatAndDrop(int /*level*/, int module,
                                                                 const char* file,
                                                                 const char* function, int /*line*/,
                                                                 const char* format, ...) {
@@ -21,6 +27,10 @@ __attribute__((format(printf, 6, 7))) inline void formatAndDrop(int /*level*/, i
     // vsnprintf reads every %s to its end even when the text is cut.
     std::vsnprintf(text, sizeof text, format, args);
     va_end(args);
+    if (module == XLOG_MODULE_HCALL && std::strncmp(text, "returning [", 11) == 0) {
+        ++g_exitLines;
+        g_lastExitLine = text;
+    }
     std::snprintf(text, sizeof text, "%s %s", file, function);
 }
 

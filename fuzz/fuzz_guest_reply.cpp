@@ -65,17 +65,21 @@ void callOnce(FuzzedDataProvider& in, const VmsgDeviceScript& s, bool connected)
     fuzz::Call call;
     fuzz::drawCall(in, in.ConsumeIntegralInRange<uint32_t>(1, hcall::kNumOps), call, 64, 96);
     const size_t before = vmsgDeviceExchanges().size();
+    const int exitLinesBefore = fuzz::g_exitLines;
     const int64_t result = fuzz::invoke(call);
+    const bool exitLine = fuzz::g_exitLines == exitLinesBefore + 1;
     const std::vector<VmsgDeviceExchange> after = vmsgDeviceExchanges();
 
     if (!fuzz::fits(call, connected)) {
         expect(after.size() == before, "a refused call reaches no host");
+        expect(fuzz::g_exitLines == exitLinesBefore, "a refused call writes no exit line");
         fuzz::expectUntouched(call, result);
         return;
     }
     expect(after.size() == before + 1, "an accepted call makes one exchange");
     const VmsgDeviceExchange& x = after.back();
     if (x.sendErrno != 0) {
+        expect(fuzz::g_exitLines == exitLinesBefore, "a failed exchange writes no exit line");
         fuzz::expectUntouched(call, result);
         return;
     }
@@ -100,11 +104,18 @@ void callOnce(FuzzedDataProvider& in, const VmsgDeviceScript& s, bool connected)
             pos += 8;
         }
     }
+    // The exit line shows the result; for the launch query, its byte's value.
+    int32_t shown = int32_t(fuzz::le32(reply + pos));
     if (call.op->result == hcall::Flag) {
         expect(result == (reply[pos] != 0), "the launch answer is its field's first byte");
+        shown = reply[pos];
     } else {
-        expect(result == int32_t(fuzz::le32(reply + pos)), "the result is the reply's last word");
+        expect(result == shown, "the result is the reply's last word");
     }
+    const std::string lead =
+        "returning [" + std::to_string(shown) + "] from " + call.op->name + "(";
+    expect(exitLine && fuzz::g_lastExitLine.compare(0, lead.size(), lead) == 0,
+           "one exit line, showing what the reply says");
 }
 
 }  // namespace
