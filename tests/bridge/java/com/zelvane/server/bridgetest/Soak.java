@@ -8,6 +8,7 @@ import java.nio.file.Files;
 import java.nio.file.Path;
 import java.util.ArrayList;
 import java.util.BitSet;
+import java.util.Collections;
 import java.util.List;
 import java.util.Map;
 import java.util.SplittableRandom;
@@ -73,7 +74,7 @@ final class Soak {
     /** Every query's answer as Java saw it (launch: 1 or 0), by query thread and sequence number. */
     final int[][] answers;
     /** Results other than 0 that the forwarding methods returned: none expected. */
-    final List<String> refused = java.util.Collections.synchronizedList(new ArrayList<>());
+    final List<String> refused = Collections.synchronizedList(new ArrayList<>());
     Memory afterWarmUp;
     Memory atEnd;
 
@@ -361,7 +362,10 @@ final class Soak {
         Plan plan = Plan.ofEvents(1, seed);
         KivHostCallService service = load();
         configureHost(plan, null);
-        service.native_init();
+        // Events may start before native_init (they wait in the queue) and the
+        // end may come before it too.
+        long initAtMs = random.nextLong(100);
+        long endAtMs = random.nextLong(400);
         for (int p = 0; p < 3; p++) {
             int producer = p;
             Thread t = new Thread(() -> {
@@ -380,9 +384,14 @@ final class Soak {
             t.setDaemon(true);
             t.start();
         }
-        long pointMs = random.nextLong(400);
-        Thread.sleep(pointMs);
-        System.out.println("RESULT ending=" + how + " afterMs=" + pointMs + " served=" + SoakNative.served());
+        long started = System.nanoTime();
+        if (initAtMs < endAtMs) {
+            Thread.sleep(initAtMs);
+            service.native_init();
+        }
+        Thread.sleep(Math.max(0, endAtMs - (System.nanoTime() - started) / 1_000_000));
+        System.out.println("RESULT ending=" + how + " initAtMs=" + (initAtMs < endAtMs ? initAtMs : "never")
+                + " endAtMs=" + endAtMs + " served=" + SoakNative.served());
         System.out.flush();
         switch (how) {
             case "exit": System.exit(3); break;
