@@ -20,7 +20,7 @@ for target in "${targets[@]}"; do
   echo "== $target: ${seconds}s from $(ls "$work/corpus" | wc -l) inputs"
   if HOSTCALL_TEST_KMSG=/dev/null UBSAN_OPTIONS=print_stacktrace=1:halt_on_error=1 \
     "$build/bin/$target" -max_total_time="$seconds" -timeout=10 -rss_limit_mb=2048 \
-    -max_len=4096 -print_final_stats=1 -artifact_prefix="$work/artifacts/" \
+    -max_len=4096 -use_value_profile=1 -print_final_stats=1 -artifact_prefix="$work/artifacts/" \
     "$work/corpus" >"$work/log" 2>&1; then
     passed=$((passed + 1))
     grep -E '^(Done|stat::number_of_executed_units|stat::peak_rss_mb)' "$work/log" || true
