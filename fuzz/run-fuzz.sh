@@ -16,7 +16,9 @@ for target in "${targets[@]}"; do
   work=$build/fuzz-work/$target
   mkdir -p "$work/corpus" "$work/artifacts"
   # Seeds join what earlier runs found; the repository's copy is never written.
-  cp -n "$seeds/$target"/* "$work/corpus/"
+  for seed in "$seeds/$target"/*; do
+    [[ -e "$work/corpus/${seed##*/}" ]] || cp "$seed" "$work/corpus/"
+  done
   echo "== $target: ${seconds}s from $(ls "$work/corpus" | wc -l) inputs"
   if HOSTCALL_TEST_KMSG=/dev/null UBSAN_OPTIONS=print_stacktrace=1:halt_on_error=1 \
     "$build/bin/$target" -max_total_time="$seconds" -timeout=10 -rss_limit_mb=2048 \
