@@ -247,6 +247,11 @@ class Device {
         std::lock_guard<std::mutex> lock(mMutex);
         return mServed;
     }
+    bool waitForServed(uint64_t count, uint32_t timeoutMs) {
+        std::unique_lock<std::mutex> lock(mMutex);
+        return mServedChanged.wait_for(lock, std::chrono::milliseconds(timeoutMs),
+                                       [&] { return mServed >= count; });
+    }
     size_t openCount() {
         std::lock_guard<std::mutex> lock(mMutex);
         return mConnections.size();
@@ -403,6 +408,7 @@ class Device {
         const bool overlapped = x.overlapped || rewritten;
         if (overlapped) ++mOverlaps;
         ++mServed;
+        mServedChanged.notify_all();
         const VmsgDeviceScript& s = *x.script;
         if (!s.record && mTraceFd < 0 && !s.printCalls && !overlapped) return;
 
@@ -466,6 +472,7 @@ class Device {
 
     std::mutex mMutex;
     std::condition_variable mRecorded;
+    std::condition_variable mServedChanged;
     std::shared_ptr<const VmsgDeviceScript> mScript;
     std::map<int, Connection> mConnections;
     std::vector<VmsgDeviceExchange> mExchanges;
@@ -512,6 +519,9 @@ bool vmsgDeviceWaitForExchanges(size_t count, uint32_t timeoutMs) {
 }
 size_t vmsgDeviceOpenCount() { return vmsgdev::Device::get().openCount(); }
 uint64_t vmsgDeviceServedCount() { return vmsgdev::Device::get().served(); }
+bool vmsgDeviceWaitForServed(uint64_t count, uint32_t timeoutMs) {
+    return vmsgdev::Device::get().waitForServed(count, timeoutMs);
+}
 void vmsgDeviceSetHostHook(std::function<void(uint32_t)> hook) {
     vmsgdev::Device::get().setHook(std::move(hook));
 }

@@ -146,6 +146,9 @@ VMSG_DEVICE_API size_t vmsgDeviceOpenCount();
 // last reset. Counted whether or not exchanges are recorded, so a long run
 // can pace itself on it without the model growing.
 VMSG_DEVICE_API uint64_t vmsgDeviceServedCount();
+// Waits until the served count reaches `count` or timeoutMs passes; true when
+// it has.
+VMSG_DEVICE_API bool vmsgDeviceWaitForServed(uint64_t count, uint32_t timeoutMs);
 
 // Called inside every SEND_RECEIVE after the request was taken and before the
 // reply is written, outside the model's locks, with the operation code. Lets a

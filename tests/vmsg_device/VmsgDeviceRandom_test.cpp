@@ -96,6 +96,8 @@ TEST(VmsgDeviceRandom, Failures_WithASeed_FollowTheSharesAndRepeatExactly) {
     script.record = false;
     EXPECT_EQ(run(c, kCount, script), first) << "the same seed gives the same run, recorded or not";
     EXPECT_EQ(vmsgDeviceServedCount(), uint64_t(kCount)) << "counted without any record";
+    EXPECT_TRUE(vmsgDeviceWaitForServed(kCount, 0));
+    EXPECT_FALSE(vmsgDeviceWaitForServed(kCount + 1, 1)) << "no more than were served";
     EXPECT_TRUE(vmsgDeviceExchanges().empty());
 
     script.randomSeed = 43;

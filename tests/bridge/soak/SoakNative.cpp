@@ -106,6 +106,11 @@ JNIEXPORT jlong JNICALL Java_com_zelvane_server_bridgetest_SoakNative_served(JNI
     return jlong(vmsgDeviceServedCount());
 }
 
+JNIEXPORT jboolean JNICALL Java_com_zelvane_server_bridgetest_SoakNative_awaitServed(
+    JNIEnv*, jclass, jlong count, jlong timeoutMs) {
+    return vmsgDeviceWaitForServed(uint64_t(count), uint32_t(timeoutMs)) ? JNI_TRUE : JNI_FALSE;
+}
+
 JNIEXPORT jint JNICALL Java_com_zelvane_server_bridgetest_SoakNative_overlaps(JNIEnv*, jclass) {
     return jint(vmsgDeviceOverlapCount());
 }

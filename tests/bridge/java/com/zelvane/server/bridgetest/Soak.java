@@ -143,7 +143,9 @@ final class Soak {
 
     /** Waits until the host has served `count` exchanges since the host was configured. */
     static void awaitServed(long count) {
-        Bridge.await(count + " exchanges at the host", () -> SoakNative.served() >= count);
+        if (!SoakNative.awaitServed(count, Bridge.WORKER_TOLERANCE.toMillis()))
+            throw new AssertionError("timed out waiting for " + count + " exchanges at the host, "
+                    + SoakNative.served() + " served: events were lost");
     }
 
     /** Runs every round; the worker has delivered everything when it returns. */

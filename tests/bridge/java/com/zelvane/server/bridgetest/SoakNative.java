@@ -17,6 +17,8 @@ final class SoakNative {
             int failureResult, long seed, String tracePath);
     static native void closeTrace();
     static native long served();
+    /** Waits up to timeoutMs for the host to have served `count` exchanges; true when it has. */
+    static native boolean awaitServed(long count, long timeoutMs);
     static native int overlaps();
     /** Bytes the native allocator has handed out and not taken back. */
     static native long nativeHeapInUse();
