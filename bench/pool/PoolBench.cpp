@@ -18,7 +18,7 @@
 
 namespace {
 
-constexpr int kTasksPerRound = 20000;
+constexpr int kTasksPerRound = 60000;
 
 // What every task does: a little work on its captured values, so that the
 // task object is the size of a typical event task's small captures.
@@ -132,8 +132,9 @@ std::function<void(int)> rounds(int producers) {
     };
 }
 
-// Rounds per contender; each takes a few milliseconds.
-constexpr int kRounds = 101;
+// Rounds per contender; each takes some ten milliseconds, long enough that a
+// round rarely ends in another scheduling regime than it began in.
+constexpr int kRounds = 61;
 
 template <typename Task>
 void compare(const char* what, int producers, const char* target) {
