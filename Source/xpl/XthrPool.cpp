@@ -49,7 +49,9 @@ ThreadPool::~ThreadPool() {
     doneCond.~condition_variable();
     tasks.~deque();
     taskCond.~condition_variable();
-    mutex.~mutex();
+    // The mutex is left alive on purpose: it holds no resource, and a thread
+    // still adding tasks while the process exits (a Java thread calling a
+    // native method) must be able to take it and see `exiting`.
 }
 
 xerr_t xthrPoolInit(XthrPool* pool, int numThreads) {
