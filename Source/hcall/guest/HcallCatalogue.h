@@ -117,7 +117,8 @@ constexpr OpInfo makeOp(uint32_t code, const char* name, Result result, const ch
 }
 
 // Indexed by code - 1.
-constexpr OpInfo kOps[] = {
+// One table for the whole program, so an entry can be told apart by its address.
+inline constexpr OpInfo kOps[] = {
 #define HCALL_OP_INFO(code, name, result, sig, params) \
     makeOp<HCALL_UNPAREN params>(code, #name, result, sig),
     HCALL_CATALOGUE(HCALL_OP_INFO)
