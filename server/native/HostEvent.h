@@ -10,6 +10,7 @@
 #include <array>
 #include <string>
 #include <tuple>
+#include <type_traits>
 #include <utility>
 
 #include "BridgeLog.h"
@@ -184,8 +185,21 @@ jint forwardEvent(JNIEnv* env, jobject object, Java... java) {
     std::tuple<Stored<Java>...> values{read(java)...};
     if (read.missing()) return -1;
     writeDetailLine<Texts>(values);
-    xthrPoolAddTask(&g_thr_pool,
-                    [values = std::move(values)] { runTask<Texts, hostCall>(values); });
+    if constexpr ((std::is_trivially_copyable_v<Stored<Java>> && ...)) {
+        // Plain values are captured one by one: std::tuple is never trivially
+        // copyable, and only a trivially copyable task fits inside
+        // std::function without a heap block per event.
+        std::apply(
+            [](auto... value) {
+                xthrPoolAddTask(&g_thr_pool, [value...] {
+                    runTask<Texts, hostCall>(std::make_tuple(value...));
+                });
+            },
+            values);
+    } else {
+        xthrPoolAddTask(&g_thr_pool,
+                        [values = std::move(values)] { runTask<Texts, hostCall>(values); });
+    }
     return 0;
 }
 
