@@ -13,6 +13,8 @@ namespace {
 
 constexpr const char* kSourcePath = "Source/xpl/Xlog";
 constexpr const char* kDefaultLevels = "*:I XMEM:D";
+constexpr const char* kLibInitSignature =
+    "xerr_t xlogLibInit(const XlogLogger *, const string &, const string &)";
 constexpr long long kRotateSize = 10485760;
 constexpr size_t kTimeTextSize = 128;
 constexpr long long kMicrosPerSecond = 1000000;
@@ -89,17 +91,14 @@ xerr_t xlogLibInit(const XlogLogger* logger, const std::string& logFile,
     XlogState* state = xlogState();
     if (logger != nullptr) {
         state->logger = *logger;
-        XLOG_AT(XLOG_MODULE_XLOG, XLOG_LEVEL_D, kSourcePath,
-                "xerr_t xlogLibInit(const XlogLogger *, const string &, const string &)",
+        XLOG_AT(XLOG_MODULE_XLOG, XLOG_LEVEL_D, kSourcePath, kLibInitSignature,
                 "xlog inited using logger");
         return XERR_SUCCESS;
     }
     xerr_t err = xlogSetFile(logFile);
     if (err != XERR_SUCCESS) {
         // The caller recovers from a log file it cannot open; no break.
-        XLOG_FATAL_LINE(XLOG_MODULE_XLOG, kSourcePath,
-                        "xerr_t xlogLibInit(const XlogLogger *, const string &, const string &)",
-                        "xlogLibInit");
+        XLOG_FATAL_LINE(XLOG_MODULE_XLOG, kSourcePath, kLibInitSignature, "xlogLibInit");
         return err;
     }
     fillTables(state);
@@ -107,9 +106,7 @@ xerr_t xlogLibInit(const XlogLogger* logger, const std::string& logFile,
     // overridden by them.
     xlogSetLevels(kDefaultLevels);
     state->utcOffset = utcOffsetSuffix();
-    XLOG_AT(XLOG_MODULE_XLOG, XLOG_LEVEL_D, kSourcePath,
-            "xerr_t xlogLibInit(const XlogLogger *, const string &, const string &)",
-            "xlog lib init done.");
+    XLOG_AT(XLOG_MODULE_XLOG, XLOG_LEVEL_D, kSourcePath, kLibInitSignature, "xlog lib init done.");
     return XERR_SUCCESS;
 }
 
