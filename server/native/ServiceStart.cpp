@@ -69,8 +69,9 @@ bool bringUp() {
         }
         gStart.connected = true;
     }
-    xthrPoolInit(&g_thr_pool, 1);
-    gStart.workerStarted = true;
+    // The start goes on whatever the pool answers, but a worker that could not
+    // be created is not remembered as started, so a later call tries again.
+    gStart.workerStarted = xthrPoolInit(&g_thr_pool, 1) == XERR_SUCCESS;
     return true;
 }
 
