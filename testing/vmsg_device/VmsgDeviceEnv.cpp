@@ -1,29 +1,6 @@
-// Start-up script of a preloaded device, read from the environment:
-//
-//   VMSG_DEVICE_CAPACITY=n         both buffer capacities (default 65536)
-//   VMSG_DEVICE_HOST_CAPACITY=n    host-bound capacity alone
-//   VMSG_DEVICE_GUEST_CAPACITY=n   guest-bound capacity alone
-//   VMSG_DEVICE_GUEST_OFFSET=n     guest-bound offset (default: after the host-bound
-//                                  buffer, page-rounded)
-//   VMSG_DEVICE_SPARE=n            the spare out-word of CONNECT
-//   VMSG_DEVICE_RESULTS=12=-5,24=0 result per operation code
-//   VMSG_DEVICE_DEFAULT_RESULT=n   result of every other operation (default 0)
-//   VMSG_DEVICE_LAUNCH_ALLOWED=0|1 answer of operation 24 unless RESULTS names it (default 1)
-//   VMSG_DEVICE_PROPS=text  VMSG_DEVICE_PROPS_VALUE=n     filled data of operation 1
-//   VMSG_DEVICE_TIME=n      VMSG_DEVICE_TIME_TEXT=text    filled data of operation 5
-//   VMSG_DEVICE_DELAY_US=n         pause before each reply
-//   VMSG_DEVICE_DELAY_JITTER_US=n  a further random pause of 0 to n
-//   VMSG_DEVICE_FAIL_PER_MILLE=n   answer n of every 1000 exchanges, at random, with
-//   VMSG_DEVICE_FAIL_RESULT=n        this result (default 5)
-//   VMSG_DEVICE_SEND_FAIL_PER_MILLE=n  fail n of every 1000 SEND_RECEIVE with EIO
-//   VMSG_DEVICE_SEED=n             seed of those random choices (default 1)
-//   VMSG_DEVICE_FAIL=open|connect|mmap|send[:errno]   inject one failure
-//   VMSG_DEVICE_REPLY=short:n|garbage|raw:hex          replace the proper reply
-//   VMSG_DEVICE_TRACE=/path        append one line per exchange
-//   VMSG_DEVICE_PRINT=1            print each decoded call on standard error
-//   VMSG_DEVICE_RECORD=0           keep no exchanges in memory
-//
-// Numbers are decimal or 0x-prefixed hex.
+// The start-up script of a preloaded device, read from the VMSG_DEVICE_*
+// environment variables that README.md lists. Numbers are decimal or
+// 0x-prefixed hex; an unreadable value is reported and ignored.
 #include <errno.h>
 
 #include <cstdio>
@@ -31,8 +8,8 @@
 #include <cstring>
 #include <string>
 
-#include "HcallDecoder.h"
 #include "VmsgDeviceInternal.h"
+#include "hcall/host/HcallHost.h"
 
 namespace vmsgdev {
 namespace {
@@ -119,8 +96,6 @@ bool parseSwitch(const std::string& text, bool& field) {
     return true;
 }
 
-}  // namespace
-
 bool parseResults(const std::string& text, std::map<uint32_t, int32_t>& results) {
     size_t start = 0;
     while (start <= text.size()) {
@@ -136,6 +111,8 @@ bool parseResults(const std::string& text, std::map<uint32_t, int32_t>& results)
     }
     return true;
 }
+
+}  // namespace
 
 VmsgDeviceScript scriptFromEnvironment() {
     VmsgDeviceScript s;

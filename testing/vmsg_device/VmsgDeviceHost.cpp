@@ -13,13 +13,15 @@
 #include <memory>
 #include <mutex>
 
-#include "HcallDecoder.h"
 #include "VmsgDeviceInternal.h"
 #include "VmsgDeviceReply.h"
+#include "hcall/host/HcallBytes.h"
 #include "vmsg/guest/VmsgDevice.h"
 
 namespace vmsgdev {
 namespace {
+
+using hcall::le32;
 
 // Which descriptors are the device's, readable without a lock because every
 // close() and ioctl() in the process asks.
@@ -45,9 +47,9 @@ constexpr uint64_t kMaxBackedLayout = uint64_t(256) << 20;
 struct SharedMemory {
     uint8_t* view = nullptr;
     size_t length = 0;
+    HcallLimits limits;          // the connection's capacities
     uint32_t requestBytes = 0;   // readable host-bound bytes
     uint32_t guestOffset = 0;    // where the reply goes
-    uint32_t replyBytes = 0;     // writable guest-bound bytes
     std::vector<uint8_t> taken;  // the request as the host took it
     ~SharedMemory() {
         if (view != nullptr) munmap(view, length);
@@ -56,19 +58,9 @@ struct SharedMemory {
 
 struct Connection {
     bool connected = false;
-    uint32_t hostBoundCapacity = 0;
-    uint32_t guestBoundCapacity = 0;
     int inFlight = 0;
     std::shared_ptr<SharedMemory> memory;  // null when the layout is not backed
 };
-
-uint32_t le32(const uint8_t* p) {
-    return uint32_t(p[0]) | uint32_t(p[1]) << 8 | uint32_t(p[2]) << 16 | uint32_t(p[3]) << 24;
-}
-
-void putLe32(uint8_t* p, uint32_t v) {
-    for (int i = 0; i < 4; ++i) p[i] = uint8_t(v >> (8 * i));
-}
 
 int fail(int err) {
     errno = err;
@@ -76,8 +68,7 @@ int fail(int err) {
 }
 
 void writeAll(int fd, const std::string& text) {
-    size_t done = 0;
-    while (done < text.size()) {
+    for (size_t done = 0; done < text.size();) {
         const ssize_t n = write(fd, text.data() + done, text.size() - done);
         if (n < 0 && errno == EINTR) continue;
         if (n <= 0) break;
@@ -85,14 +76,13 @@ void writeAll(int fd, const std::string& text) {
     }
 }
 
-// What one exchange carries from its start to its record.
+// What one exchange carries from its start to its record: copied or shared
+// under the lock, so the host serves it with the lock released.
 struct Exchange {
     int fd = -1;
     std::shared_ptr<const VmsgDeviceScript> script;
     std::shared_ptr<SharedMemory> memory;
     std::function<void(uint32_t)> hook;
-    uint32_t hostBoundCapacity = 0;
-    uint32_t guestBoundCapacity = 0;
     uint64_t seq = 0;
     bool overlapped = false;
     uint32_t requestLen = 0;
@@ -106,19 +96,25 @@ struct Exchange {
 class Random {
   public:
     void seed(uint64_t seed) { mState = seed; }
-    uint64_t next() {
+    uint32_t upTo(uint32_t bound) {
         uint64_t z = (mState += 0x9E3779B97F4A7C15ULL);
         z = (z ^ (z >> 30)) * 0xBF58476D1CE4E5B9ULL;
         z = (z ^ (z >> 27)) * 0x94D049BB133111EBULL;
-        return z ^ (z >> 31);
+        return uint32_t((z ^ (z >> 31)) % (uint64_t(bound) + 1));
     }
-    // Uniform enough in [0, bound] for pauses and shares.
-    uint32_t upTo(uint32_t bound) { return uint32_t(next() % (uint64_t(bound) + 1)); }
     bool perMille(uint32_t share) { return share != 0 && upTo(999) < share; }
 
   private:
     uint64_t mState = 0;
 };
+
+VmsgDeviceEvent event(VmsgDeviceEventKind kind, int fd, unsigned long request = 0) {
+    VmsgDeviceEvent ev;
+    ev.kind = kind;
+    ev.fd = fd;
+    ev.request = request;
+    return ev;
+}
 
 class Device {
   public:
@@ -136,51 +132,38 @@ class Device {
 
     int open(int flags) {
         std::lock_guard<std::mutex> lock(mMutex);
-        VmsgDeviceEvent ev;
-        ev.kind = VmsgDeviceEventKind::Open;
-        ev.openFlags = flags;
         int fd = -1;
         if (mScript->openErrno != 0) {
             fd = fail(mScript->openErrno);
         } else {
             fd = memfd_create("kivvmsg",
                               MFD_ALLOW_SEALING | ((flags & O_CLOEXEC) ? MFD_CLOEXEC : 0));
-            if (fd >= kMaxFd) {
-                ::close(fd);
-                fd = fail(EMFILE);
-            }
+            if (fd >= kMaxFd) fd = (::close(fd), fail(EMFILE));
         }
         if (fd >= 0) {
             mConnections[fd] = Connection{};
             markDeviceFd(fd, true);
         }
-        ev.fd = ev.result = fd;
-        ev.error = fd < 0 ? errno : 0;
-        recordEvent(ev);
-        errno = ev.error;
-        return fd;
+        VmsgDeviceEvent ev = event(VmsgDeviceEventKind::Open, fd);
+        ev.openFlags = flags;
+        return record(ev, fd);
     }
 
     int ioctl(int fd, unsigned long request, void* arg) {
         if (request == VMSG_IOC_SEND_RECEIVE) return sendReceive(fd);
         std::lock_guard<std::mutex> lock(mMutex);
-        VmsgDeviceEvent ev;
-        ev.fd = fd;
-        ev.request = request;
+        VmsgDeviceEvent ev = event(VmsgDeviceEventKind::OtherIoctl, fd, request);
+        int result = -1;
         if (request == VMSG_IOC_CONNECT) {
             ev.kind = VmsgDeviceEventKind::Connect;
-            ev.result = connect(fd, static_cast<uint8_t*>(arg), ev);
+            result = connect(fd, static_cast<uint8_t*>(arg), ev);
         } else if (request == VMSG_IOC_DISCONNECT) {
             ev.kind = VmsgDeviceEventKind::Disconnect;
-            ev.result = disconnect(fd);
+            result = disconnect(fd);
         } else {
-            ev.kind = VmsgDeviceEventKind::OtherIoctl;
-            ev.result = fail(ENOTTY);
+            result = fail(ENOTTY);
         }
-        ev.error = ev.result < 0 ? errno : 0;
-        recordEvent(ev);
-        errno = ev.error;
-        return ev.result;
+        return record(ev, result);
     }
 
     int close(int fd, int (*realClose)(int)) {
@@ -191,17 +174,10 @@ class Device {
         }  // release lock: the descriptor is no longer ours when the number is reused
         const int result = realClose(fd);
         const int err = errno;
-        VmsgDeviceEvent ev;
-        ev.kind = VmsgDeviceEventKind::Close;
-        ev.fd = fd;
-        ev.result = result;
-        ev.error = result < 0 ? err : 0;
-        {
-            std::lock_guard<std::mutex> lock(mMutex);
-            recordEvent(ev);
-        }
+        std::lock_guard<std::mutex> lock(mMutex);
+        VmsgDeviceEvent ev = event(VmsgDeviceEventKind::Close, fd);
         errno = err;
-        return result;
+        return record(ev, result);
     }
 
     void configure(const VmsgDeviceScript& script) {
@@ -222,62 +198,55 @@ class Device {
         mHook = nullptr;
     }
 
-    VmsgDeviceScript script() {
+    // Reads one piece of state under the lock.
+    template <typename Read>
+    auto read(Read read) {
         std::lock_guard<std::mutex> lock(mMutex);
-        return *mScript;
+        return read();
     }
-    std::vector<VmsgDeviceExchange> exchanges() {
-        std::lock_guard<std::mutex> lock(mMutex);
-        return mExchanges;
-    }
-    std::vector<VmsgDeviceEvent> events() {
-        std::lock_guard<std::mutex> lock(mMutex);
-        return mEvents;
-    }
-    size_t overlaps() {
-        std::lock_guard<std::mutex> lock(mMutex);
-        return mOverlaps;
-    }
-    bool waitForExchanges(size_t count, uint32_t timeoutMs) {
+    template <typename Done>
+    bool waitFor(std::condition_variable& changed, uint32_t timeoutMs, Done done) {
         std::unique_lock<std::mutex> lock(mMutex);
-        return mRecorded.wait_for(lock, std::chrono::milliseconds(timeoutMs),
-                                  [&] { return mExchanges.size() >= count; });
-    }
-    uint64_t served() {
-        std::lock_guard<std::mutex> lock(mMutex);
-        return mServed;
-    }
-    bool waitForServed(uint64_t count, uint32_t timeoutMs) {
-        std::unique_lock<std::mutex> lock(mMutex);
-        return mServedChanged.wait_for(lock, std::chrono::milliseconds(timeoutMs),
-                                       [&] { return mServed >= count; });
-    }
-    size_t openCount() {
-        std::lock_guard<std::mutex> lock(mMutex);
-        return mConnections.size();
-    }
-    void setHook(std::function<void(uint32_t)> hook) {
-        std::lock_guard<std::mutex> lock(mMutex);
-        mHook = std::move(hook);
+        return changed.wait_for(lock, std::chrono::milliseconds(timeoutMs), done);
     }
 
+    std::shared_ptr<const VmsgDeviceScript> mScript;
+    std::map<int, Connection> mConnections;
+    std::vector<VmsgDeviceExchange> mExchanges;
+    std::vector<VmsgDeviceEvent> mEvents;
+    size_t mOverlaps = 0;
+    uint64_t mServed = 0;
+    std::function<void(uint32_t)> mHook;
+    std::condition_variable mRecorded;
+    std::condition_variable mServedChanged;
+
   private:
+    // Records a call's event with its result and errno, and returns the result
+    // with errno as the call left it.
+    int record(VmsgDeviceEvent& ev, int result) {
+        const int err = errno;
+        ev.result = result;
+        ev.error = result < 0 ? err : 0;
+        if (ev.kind == VmsgDeviceEventKind::Open) ev.fd = result;
+        if (mScript->record) mEvents.push_back(ev);
+        errno = err;
+        return result;
+    }
+
     int connect(int fd, uint8_t* arg, VmsgDeviceEvent& ev) {
         const auto it = mConnections.find(fd);
         if (it == mConnections.end()) return fail(EBADF);
         if (arg == nullptr) return fail(EFAULT);
         std::memcpy(ev.connectIn.data(), arg, ev.connectIn.size());
-        Connection& conn = it->second;
-        const VmsgDeviceScript& s = *mScript;
         int result = 0;
-        if (conn.connected) {
+        if (it->second.connected) {
             result = fail(EISCONN);
         } else if (le32(arg) != hcall::kServiceId) {
             result = fail(ECONNREFUSED);
-        } else if (s.connectErrno != 0) {
-            result = fail(s.connectErrno);
+        } else if (mScript->connectErrno != 0) {
+            result = fail(mScript->connectErrno);
         } else {
-            result = establish(fd, conn, arg);
+            result = establish(fd, it->second, arg);
         }
         std::memcpy(ev.connectOut.data(), arg, ev.connectOut.size());
         return result;
@@ -294,21 +263,14 @@ class Device {
         const uint64_t length = uint64_t(offset) + s.guestBoundCapacity;
         if (length != 0 && length <= kMaxBackedLayout) {
             if (ftruncate(fd, off_t(length)) != 0) return -1;
-            if (s.mmapFails) {
-                // No writable shared mapping of the memfd can be made after
-                // this seal, so the client's mmap fails in the kernel.
-                if (fcntl(fd, F_ADD_SEALS, F_SEAL_WRITE) != 0) return -1;
-            } else if (!backConnection(fd, conn, length, offset)) {
-                return -1;
-            }
+            // After this seal no writable shared mapping of the memfd can be
+            // made, so the client's mmap fails in the kernel.
+            if (s.mmapFails && fcntl(fd, F_ADD_SEALS, F_SEAL_WRITE) != 0) return -1;
+            if (!s.mmapFails && !backConnection(fd, conn, length, offset)) return -1;
         }
         conn.connected = true;
-        conn.hostBoundCapacity = s.hostBoundCapacity;
-        conn.guestBoundCapacity = s.guestBoundCapacity;
-        putLe32(arg + 4, s.hostBoundCapacity);
-        putLe32(arg + 8, s.guestBoundCapacity);
-        putLe32(arg + 12, s.spare);
-        putLe32(arg + 16, offset);
+        const uint32_t words[] = {s.hostBoundCapacity, s.guestBoundCapacity, s.spare, offset};
+        for (int i = 0; i < 4; ++i) hcall::putLe32(arg + 4 + 4 * i, words[i]);
         return 0;
     }
 
@@ -318,9 +280,9 @@ class Device {
         auto memory = std::make_shared<SharedMemory>();
         memory->view = static_cast<uint8_t*>(view);
         memory->length = length;
+        memory->limits = HcallLimits{mScript->hostBoundCapacity, mScript->guestBoundCapacity};
         memory->requestBytes = uint32_t(std::min<uint64_t>(mScript->hostBoundCapacity, length));
         memory->guestOffset = offset;
-        memory->replyBytes = mScript->guestBoundCapacity;
         memory->taken.resize(memory->requestBytes);
         conn.memory = std::move(memory);
         return true;
@@ -334,68 +296,57 @@ class Device {
         return 0;
     }
 
-    // Starts an exchange under the lock: everything it needs is copied or
-    // shared, so the host can serve it with the lock released.
     int begin(int fd, Exchange& x) {
         std::lock_guard<std::mutex> lock(mMutex);
         const auto it = mConnections.find(fd);
-        if (it == mConnections.end()) return fail(EBADF);
-        Connection& conn = it->second;
-        if (!conn.connected) return fail(ENOTCONN);
-        if (!conn.memory) return fail(EFAULT);
+        int result = 0;
+        if (it == mConnections.end()) {
+            result = fail(EBADF);
+        } else if (!it->second.connected) {
+            result = fail(ENOTCONN);
+        } else if (!it->second.memory) {
+            result = fail(EFAULT);
+        }
+        if (result != 0) {
+            VmsgDeviceEvent ev = event(VmsgDeviceEventKind::SendReceive, fd, VMSG_IOC_SEND_RECEIVE);
+            return record(ev, result);
+        }
         x.fd = fd;
         x.script = mScript;
-        x.memory = conn.memory;
-        if (mHook) x.hook = mHook;
-        x.hostBoundCapacity = conn.hostBoundCapacity;
-        x.guestBoundCapacity = conn.guestBoundCapacity;
+        x.memory = it->second.memory;
+        x.hook = mHook;
         x.seq = mSeq++;
-        x.overlapped = ++conn.inFlight > 1;
+        x.overlapped = ++it->second.inFlight > 1;
         const VmsgDeviceScript& s = *mScript;
         if (s.delayJitterUs != 0) x.extraDelayUs = mRandom.upTo(s.delayJitterUs);
         if (mRandom.perMille(s.sendFailurePerMille)) x.sendErrno = EIO;
         x.failed = mRandom.perMille(s.failurePerMille);
+        if (s.sendErrno != 0) x.sendErrno = s.sendErrno;
         return 0;
     }
 
+    // Takes the request, lets the host answer it, and records the exchange.
     int sendReceive(int fd) {
         Exchange x;
-        if (begin(fd, x) != 0) {
-            const int err = errno;
-            std::lock_guard<std::mutex> lock(mMutex);
-            VmsgDeviceEvent ev;
-            ev.kind = VmsgDeviceEventKind::SendReceive;
-            ev.fd = fd;
-            ev.request = VMSG_IOC_SEND_RECEIVE;
-            ev.result = -1;
-            ev.error = err;
-            recordEvent(ev);
-            return fail(err);
-        }
+        if (begin(fd, x) != 0) return -1;
         SharedMemory& m = *x.memory;
         // An overlapping exchange must not share the snapshot buffer with
         // the one it overlaps.
-        std::vector<uint8_t> ownCopy;
-        uint8_t* taken = m.taken.data();
-        if (x.overlapped) {
-            ownCopy.resize(m.requestBytes);
-            taken = ownCopy.data();
-        }
+        std::vector<uint8_t> ownCopy(x.overlapped ? m.requestBytes : 0);
+        uint8_t* taken = x.overlapped ? ownCopy.data() : m.taken.data();
         const uint32_t total = m.requestBytes >= 8 ? le32(m.view + 4) : 0;
         x.requestLen = std::min(m.requestBytes, std::max<uint32_t>(total, 8));
         if (x.requestLen != 0) std::memcpy(taken, m.view, x.requestLen);
 
         bool rewritten = false;
-        if (x.script->sendErrno != 0) x.sendErrno = x.script->sendErrno;
         if (x.sendErrno == 0) {
-            const HcallDecoded d =
-                hcallCheck(taken, x.requestLen, x.hostBoundCapacity, x.guestBoundCapacity);
             const uint32_t delayUs = x.script->delayUs + x.extraDelayUs;
             if (delayUs != 0) usleep(delayUs);
-            if (x.hook) x.hook(d.opCode);
+            if (x.hook) x.hook(x.requestLen >= 4 ? le32(taken) : 0);
             rewritten = x.requestLen != 0 && std::memcmp(taken, m.view, x.requestLen) != 0;
             x.replyLen =
-                writeReply(*x.script, d, m.view + m.guestOffset, m.replyBytes, x.seq, x.failed);
+                writeReply(*x.script, taken, x.requestLen, m.limits, m.view + m.guestOffset,
+                           m.limits.guestBoundCapacity, x.seq, x.failed);
         }
         finish(x, taken, rewritten);
         return x.sendErrno != 0 ? fail(x.sendErrno) : 0;
@@ -406,7 +357,7 @@ class Device {
         const auto it = mConnections.find(x.fd);
         if (it != mConnections.end() && it->second.memory == x.memory) --it->second.inFlight;
         const bool overlapped = x.overlapped || rewritten;
-        if (overlapped) ++mOverlaps;
+        mOverlaps += overlapped;
         ++mServed;
         mServedChanged.notify_all();
         const VmsgDeviceScript& s = *x.script;
@@ -416,14 +367,13 @@ class Device {
         e.request.assign(taken, taken + x.requestLen);
         const uint8_t* reply = x.memory->view + x.memory->guestOffset;
         if (x.sendErrno == 0) e.reply.assign(reply, reply + x.replyLen);
-        const HcallDecoded d =
-            hcallDecode(e.request.data(), e.request.size(), x.sendErrno ? nullptr : reply,
-                        x.replyLen, x.hostBoundCapacity, x.guestBoundCapacity);
-        e.opCode = d.opCode;
-        e.wellFormed = d.wellFormed;
-        e.problem = d.problem;
-        e.text = d.text;
-        if (x.sendErrno != 0) e.text += " -> !failed: errno " + std::to_string(x.sendErrno);
+        const HcallRequest r = hcallParseRequest(taken, x.requestLen, x.memory->limits);
+        e.opCode = r.opCode;
+        e.wellFormed = r.ok();
+        e.problem = hcallFaultText(r);
+        e.text = x.sendErrno != 0
+                     ? hcallCallText(r) + " -> !failed: errno " + std::to_string(x.sendErrno)
+                     : hcallExchangeText(r, e.reply.data(), e.reply.size());
         e.sendErrno = x.sendErrno;
         e.overlapped = overlapped;
         report(e, s);
@@ -431,29 +381,20 @@ class Device {
             mExchanges.push_back(std::move(e));
             mRecorded.notify_all();
         }
-        VmsgDeviceEvent ev;
-        ev.kind = VmsgDeviceEventKind::SendReceive;
-        ev.fd = x.fd;
-        ev.request = VMSG_IOC_SEND_RECEIVE;
-        ev.result = x.sendErrno ? -1 : 0;
-        ev.error = x.sendErrno;
-        recordEvent(ev);
+        VmsgDeviceEvent ev = event(VmsgDeviceEventKind::SendReceive, x.fd, VMSG_IOC_SEND_RECEIVE);
+        errno = x.sendErrno;
+        record(ev, x.sendErrno ? -1 : 0);
     }
 
     void report(const VmsgDeviceExchange& e, const VmsgDeviceScript& s) {
         if (e.overlapped)
             writeAll(STDERR_FILENO, "vmsg-device: overlapping exchange: " + e.text + "\n");
         if (s.printCalls) writeAll(STDERR_FILENO, e.text + "\n");
-        if (mTraceFd >= 0) {
-            const std::string reply =
-                e.sendErrno ? std::string("-") : hcallHex(e.reply.data(), e.reply.size());
-            writeAll(mTraceFd, "req=" + hcallHex(e.request.data(), e.request.size()) + " reply=" +
-                                   reply + " " + e.text + (e.overlapped ? " !overlap" : "") + "\n");
-        }
-    }
-
-    void recordEvent(const VmsgDeviceEvent& ev) {
-        if (mScript->record) mEvents.push_back(ev);
+        if (mTraceFd < 0) return;
+        const std::string reply =
+            e.sendErrno ? std::string("-") : hcallHex(e.reply.data(), e.reply.size());
+        writeAll(mTraceFd, "req=" + hcallHex(e.request.data(), e.request.size()) + " reply=" +
+                               reply + " " + e.text + (e.overlapped ? " !overlap" : "") + "\n");
     }
 
     void openTrace() {
@@ -471,19 +412,12 @@ class Device {
     }
 
     std::mutex mMutex;
-    std::condition_variable mRecorded;
-    std::condition_variable mServedChanged;
-    std::shared_ptr<const VmsgDeviceScript> mScript;
-    std::map<int, Connection> mConnections;
-    std::vector<VmsgDeviceExchange> mExchanges;
-    std::vector<VmsgDeviceEvent> mEvents;
-    size_t mOverlaps = 0;
-    uint64_t mServed = 0;
     uint64_t mSeq = 0;
     Random mRandom;
-    std::function<void(uint32_t)> mHook;
     int mTraceFd = -1;
 };
+
+Device& device() { return Device::get(); }
 
 }  // namespace
 
@@ -496,32 +430,44 @@ bool isDeviceFd(int fd) {
     return (gDeviceFds[fd / 64].load(std::memory_order_acquire) >> (fd % 64)) & 1;
 }
 
-int openDevice(int flags) { return Device::get().open(flags); }
-
+int openDevice(int flags) { return device().open(flags); }
 int deviceIoctl(int fd, unsigned long request, void* arg) {
-    return Device::get().ioctl(fd, request, arg);
+    return device().ioctl(fd, request, arg);
 }
-
-int closeDevice(int fd, int (*realClose)(int)) { return Device::get().close(fd, realClose); }
+int closeDevice(int fd, int (*realClose)(int)) { return device().close(fd, realClose); }
 
 }  // namespace vmsgdev
 
-void vmsgDeviceConfigure(const VmsgDeviceScript& script) {
-    vmsgdev::Device::get().configure(script);
+using vmsgdev::device;
+
+void vmsgDeviceConfigure(const VmsgDeviceScript& script) { device().configure(script); }
+VmsgDeviceScript vmsgDeviceScript() {
+    return device().read([] { return *device().mScript; });
 }
-VmsgDeviceScript vmsgDeviceScript() { return vmsgdev::Device::get().script(); }
-void vmsgDeviceReset() { vmsgdev::Device::get().reset(); }
-std::vector<VmsgDeviceExchange> vmsgDeviceExchanges() { return vmsgdev::Device::get().exchanges(); }
-std::vector<VmsgDeviceEvent> vmsgDeviceEvents() { return vmsgdev::Device::get().events(); }
-size_t vmsgDeviceOverlapCount() { return vmsgdev::Device::get().overlaps(); }
+void vmsgDeviceReset() { device().reset(); }
+std::vector<VmsgDeviceExchange> vmsgDeviceExchanges() {
+    return device().read([] { return device().mExchanges; });
+}
+std::vector<VmsgDeviceEvent> vmsgDeviceEvents() {
+    return device().read([] { return device().mEvents; });
+}
+size_t vmsgDeviceOverlapCount() {
+    return device().read([] { return device().mOverlaps; });
+}
 bool vmsgDeviceWaitForExchanges(size_t count, uint32_t timeoutMs) {
-    return vmsgdev::Device::get().waitForExchanges(count, timeoutMs);
+    return device().waitFor(device().mRecorded, timeoutMs,
+                            [count] { return device().mExchanges.size() >= count; });
 }
-size_t vmsgDeviceOpenCount() { return vmsgdev::Device::get().openCount(); }
-uint64_t vmsgDeviceServedCount() { return vmsgdev::Device::get().served(); }
+size_t vmsgDeviceOpenCount() {
+    return device().read([] { return device().mConnections.size(); });
+}
+uint64_t vmsgDeviceServedCount() {
+    return device().read([] { return device().mServed; });
+}
 bool vmsgDeviceWaitForServed(uint64_t count, uint32_t timeoutMs) {
-    return vmsgdev::Device::get().waitForServed(count, timeoutMs);
+    return device().waitFor(device().mServedChanged, timeoutMs,
+                            [count] { return device().mServed >= count; });
 }
 void vmsgDeviceSetHostHook(std::function<void(uint32_t)> hook) {
-    vmsgdev::Device::get().setHook(std::move(hook));
+    device().read([&hook] { device().mHook = std::move(hook); });
 }

@@ -21,7 +21,5 @@ int closeDevice(int fd, int (*realClose)(int));
 // The script that VMSG_DEVICE_* variables describe; unset ones keep defaults.
 // Unreadable values are reported on standard error and ignored.
 VmsgDeviceScript scriptFromEnvironment();
-// Parses "12=-5,24=0"; false on a malformed list.
-bool parseResults(const std::string& text, std::map<uint32_t, int32_t>& results);
 
 }  // namespace vmsgdev

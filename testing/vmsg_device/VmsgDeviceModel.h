@@ -5,11 +5,12 @@
 // (libvmsg_device.so), it interposes open/openat, ioctl and close: opening the
 // device path yields a memfd, so the client's mmap and munmap are the real
 // calls on real shared memory, and the three device requests on that
-// descriptor are served by an in-process host that speaks the host-call
-// service "hcal". Every other path and descriptor passes through untouched.
+// descriptor are served by an in-process host built on the host half of the
+// protocol (hcall/host/HcallHost.h). Every other path and descriptor passes
+// through untouched.
 //
 // Tests drive it through the functions below; a preloaded copy reads the same
-// settings from VMSG_DEVICE_* environment variables (see VmsgDeviceEnv.cpp).
+// settings from VMSG_DEVICE_* environment variables (listed in README.md).
 // All functions are thread-safe.
 #pragma once
 
