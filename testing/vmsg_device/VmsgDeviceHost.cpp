@@ -9,12 +9,13 @@
 #include <atomic>
 #include <chrono>
 #include <condition_variable>
+#include <cstdio>
 #include <cstring>
 #include <memory>
 #include <mutex>
+#include <random>
 
 #include "VmsgDeviceInternal.h"
-#include "VmsgDeviceReply.h"
 #include "hcall/host/HcallBytes.h"
 #include "vmsg/guest/VmsgDevice.h"
 
@@ -22,19 +23,12 @@ namespace vmsgdev {
 namespace {
 
 using hcall::le32;
+using Kind = VmsgDeviceEventKind;
 
 // Which descriptors are the device's, readable without a lock because every
 // close() and ioctl() in the process asks.
 constexpr int kMaxFd = 65536;
-std::atomic<uint64_t> gDeviceFds[kMaxFd / 64];
-
-void markDeviceFd(int fd, bool on) {
-    const uint64_t bit = uint64_t(1) << (fd % 64);
-    if (on)
-        gDeviceFds[fd / 64].fetch_or(bit, std::memory_order_release);
-    else
-        gDeviceFds[fd / 64].fetch_and(~bit, std::memory_order_release);
-}
+std::atomic<bool> gDeviceFds[kMaxFd];
 
 // Layouts larger than this are answered on CONNECT but never backed: the
 // client's mapping of such a size is its own business, and the host serves
@@ -67,17 +61,8 @@ int fail(int err) {
     return -1;
 }
 
-void writeAll(int fd, const std::string& text) {
-    for (size_t done = 0; done < text.size();) {
-        const ssize_t n = write(fd, text.data() + done, text.size() - done);
-        if (n < 0 && errno == EINTR) continue;
-        if (n <= 0) break;
-        done += size_t(n);
-    }
-}
-
 // What one exchange carries from its start to its record: copied or shared
-// under the lock, so the host serves it with the lock released.
+// under the lock, so that the host serves it with the lock released.
 struct Exchange {
     int fd = -1;
     std::shared_ptr<const VmsgDeviceScript> script;
@@ -85,36 +70,12 @@ struct Exchange {
     std::function<void(uint32_t)> hook;
     uint64_t seq = 0;
     bool overlapped = false;
+    int sendErrno = 0;
+    uint32_t delayUs = 0;
+    bool failed = false;  // answered with the script's failure result
     uint32_t requestLen = 0;
     uint32_t replyLen = 0;
-    int sendErrno = 0;
-    uint32_t extraDelayUs = 0;  // drawn at random
-    bool failed = false;        // answered with the script's failure result
 };
-
-// splitmix64: small, fast, and the same sequence on every platform.
-class Random {
-  public:
-    void seed(uint64_t seed) { mState = seed; }
-    uint32_t upTo(uint32_t bound) {
-        uint64_t z = (mState += 0x9E3779B97F4A7C15ULL);
-        z = (z ^ (z >> 30)) * 0xBF58476D1CE4E5B9ULL;
-        z = (z ^ (z >> 27)) * 0x94D049BB133111EBULL;
-        return uint32_t((z ^ (z >> 31)) % (uint64_t(bound) + 1));
-    }
-    bool perMille(uint32_t share) { return share != 0 && upTo(999) < share; }
-
-  private:
-    uint64_t mState = 0;
-};
-
-VmsgDeviceEvent event(VmsgDeviceEventKind kind, int fd, unsigned long request = 0) {
-    VmsgDeviceEvent ev;
-    ev.kind = kind;
-    ev.fd = fd;
-    ev.request = request;
-    return ev;
-}
 
 class Device {
   public:
@@ -123,42 +84,33 @@ class Device {
         openTrace();
     }
 
-    static Device& get() {
-        // Never destroyed: the client disconnects from static destructors
-        // that may run after ours would have.
-        static Device* device = new Device;
-        return *device;
-    }
-
     int open(int flags) {
         std::lock_guard<std::mutex> lock(mMutex);
-        int fd = -1;
-        if (mScript->openErrno != 0) {
-            fd = fail(mScript->openErrno);
-        } else {
-            fd = memfd_create("kivvmsg",
-                              MFD_ALLOW_SEALING | ((flags & O_CLOEXEC) ? MFD_CLOEXEC : 0));
-            if (fd >= kMaxFd) fd = (::close(fd), fail(EMFILE));
+        const unsigned cloexec = (flags & O_CLOEXEC) ? MFD_CLOEXEC : 0;
+        int fd = mScript->openErrno != 0 ? fail(mScript->openErrno)
+                                         : memfd_create("kivvmsg", MFD_ALLOW_SEALING | cloexec);
+        if (fd >= kMaxFd) {
+            ::close(fd);
+            fd = fail(EMFILE);
         }
         if (fd >= 0) {
             mConnections[fd] = Connection{};
-            markDeviceFd(fd, true);
+            gDeviceFds[fd].store(true);
         }
-        VmsgDeviceEvent ev = event(VmsgDeviceEventKind::Open, fd);
-        ev.openFlags = flags;
+        VmsgDeviceEvent ev{Kind::Open, fd, flags};
         return record(ev, fd);
     }
 
     int ioctl(int fd, unsigned long request, void* arg) {
         if (request == VMSG_IOC_SEND_RECEIVE) return sendReceive(fd);
         std::lock_guard<std::mutex> lock(mMutex);
-        VmsgDeviceEvent ev = event(VmsgDeviceEventKind::OtherIoctl, fd, request);
+        VmsgDeviceEvent ev{Kind::OtherIoctl, fd, 0, request};
         int result = -1;
         if (request == VMSG_IOC_CONNECT) {
-            ev.kind = VmsgDeviceEventKind::Connect;
+            ev.kind = Kind::Connect;
             result = connect(fd, static_cast<uint8_t*>(arg), ev);
         } else if (request == VMSG_IOC_DISCONNECT) {
-            ev.kind = VmsgDeviceEventKind::Disconnect;
+            ev.kind = Kind::Disconnect;
             result = disconnect(fd);
         } else {
             result = fail(ENOTTY);
@@ -170,12 +122,12 @@ class Device {
         {  // acquire lock
             std::lock_guard<std::mutex> lock(mMutex);
             mConnections.erase(fd);
-            markDeviceFd(fd, false);
+            gDeviceFds[fd].store(false);
         }  // release lock: the descriptor is no longer ours when the number is reused
         const int result = realClose(fd);
+        VmsgDeviceEvent ev{Kind::Close, fd};
         const int err = errno;
         std::lock_guard<std::mutex> lock(mMutex);
-        VmsgDeviceEvent ev = event(VmsgDeviceEventKind::Close, fd);
         errno = err;
         return record(ev, result);
     }
@@ -198,16 +150,20 @@ class Device {
         mHook = nullptr;
     }
 
-    // Reads one piece of state under the lock.
-    template <typename Read>
-    auto read(Read read) {
+    // A copy of one piece of state, taken under the lock.
+    template <typename T>
+    T copy(T Device::*field) {
         std::lock_guard<std::mutex> lock(mMutex);
-        return read();
+        return this->*field;
     }
-    template <typename Done>
-    bool waitFor(std::condition_variable& changed, uint32_t timeoutMs, Done done) {
+    void setHook(std::function<void(uint32_t)> hook) {
+        std::lock_guard<std::mutex> lock(mMutex);
+        mHook = std::move(hook);
+    }
+    bool waitForServed(uint64_t count, uint32_t timeoutMs) {
         std::unique_lock<std::mutex> lock(mMutex);
-        return changed.wait_for(lock, std::chrono::milliseconds(timeoutMs), done);
+        return mServedChanged.wait_for(lock, std::chrono::milliseconds(timeoutMs),
+                                       [&] { return mServed >= count; });
     }
 
     std::shared_ptr<const VmsgDeviceScript> mScript;
@@ -217,17 +173,15 @@ class Device {
     size_t mOverlaps = 0;
     uint64_t mServed = 0;
     std::function<void(uint32_t)> mHook;
-    std::condition_variable mRecorded;
     std::condition_variable mServedChanged;
 
   private:
-    // Records a call's event with its result and errno, and returns the result
-    // with errno as the call left it.
+    // Records a call with its result and errno; returns the result with errno
+    // as the call left it.
     int record(VmsgDeviceEvent& ev, int result) {
         const int err = errno;
         ev.result = result;
         ev.error = result < 0 ? err : 0;
-        if (ev.kind == VmsgDeviceEventKind::Open) ev.fd = result;
         if (mScript->record) mEvents.push_back(ev);
         errno = err;
         return result;
@@ -238,16 +192,10 @@ class Device {
         if (it == mConnections.end()) return fail(EBADF);
         if (arg == nullptr) return fail(EFAULT);
         std::memcpy(ev.connectIn.data(), arg, ev.connectIn.size());
-        int result = 0;
-        if (it->second.connected) {
-            result = fail(EISCONN);
-        } else if (le32(arg) != hcall::kServiceId) {
-            result = fail(ECONNREFUSED);
-        } else if (mScript->connectErrno != 0) {
-            result = fail(mScript->connectErrno);
-        } else {
-            result = establish(fd, it->second, arg);
-        }
+        const int result = it->second.connected             ? fail(EISCONN)
+                           : le32(arg) != hcall::kServiceId ? fail(ECONNREFUSED)
+                           : mScript->connectErrno != 0     ? fail(mScript->connectErrno)
+                                                            : establish(fd, it->second, arg);
         std::memcpy(ev.connectOut.data(), arg, ev.connectOut.size());
         return result;
     }
@@ -255,11 +203,9 @@ class Device {
     int establish(int fd, Connection& conn, uint8_t* arg) {
         const VmsgDeviceScript& s = *mScript;
         const uint64_t page = uint64_t(sysconf(_SC_PAGESIZE));
+        const uint64_t afterHost = (s.hostBoundCapacity + page - 1) / page * page;
         const uint32_t offset =
-            s.guestBoundOffset != 0
-                ? s.guestBoundOffset
-                : uint32_t(std::min<uint64_t>((s.hostBoundCapacity + page - 1) / page * page,
-                                              0xFFFFFFFFu));
+            s.guestBoundOffset ? s.guestBoundOffset : uint32_t(std::min<uint64_t>(afterHost, ~0u));
         const uint64_t length = uint64_t(offset) + s.guestBoundCapacity;
         if (length != 0 && length <= kMaxBackedLayout) {
             if (ftruncate(fd, off_t(length)) != 0) return -1;
@@ -296,42 +242,37 @@ class Device {
         return 0;
     }
 
+    // Starts an exchange under the lock, drawing its random fate.
     int begin(int fd, Exchange& x) {
         std::lock_guard<std::mutex> lock(mMutex);
         const auto it = mConnections.find(fd);
-        int result = 0;
-        if (it == mConnections.end()) {
-            result = fail(EBADF);
-        } else if (!it->second.connected) {
-            result = fail(ENOTCONN);
-        } else if (!it->second.memory) {
-            result = fail(EFAULT);
-        }
+        const int result = it == mConnections.end() ? fail(EBADF)
+                           : !it->second.connected  ? fail(ENOTCONN)
+                           : !it->second.memory     ? fail(EFAULT)
+                                                    : 0;
         if (result != 0) {
-            VmsgDeviceEvent ev = event(VmsgDeviceEventKind::SendReceive, fd, VMSG_IOC_SEND_RECEIVE);
+            VmsgDeviceEvent ev{Kind::SendReceive, fd, 0, VMSG_IOC_SEND_RECEIVE};
             return record(ev, result);
         }
-        x.fd = fd;
-        x.script = mScript;
-        x.memory = it->second.memory;
-        x.hook = mHook;
-        x.seq = mSeq++;
-        x.overlapped = ++it->second.inFlight > 1;
         const VmsgDeviceScript& s = *mScript;
-        if (s.delayJitterUs != 0) x.extraDelayUs = mRandom.upTo(s.delayJitterUs);
-        if (mRandom.perMille(s.sendFailurePerMille)) x.sendErrno = EIO;
-        x.failed = mRandom.perMille(s.failurePerMille);
+        x = Exchange{fd, mScript, it->second.memory, mHook, mSeq++, ++it->second.inFlight > 1};
+        // Each draw only when its share is set, so one setting does not move
+        // the others' sequence.
+        auto upTo = [this](uint32_t bound) { return mRandom() % (uint64_t(bound) + 1); };
+        x.delayUs = s.delayUs + (s.delayJitterUs ? uint32_t(upTo(s.delayJitterUs)) : 0);
+        x.sendErrno = s.sendFailurePerMille && upTo(999) < s.sendFailurePerMille ? EIO : 0;
         if (s.sendErrno != 0) x.sendErrno = s.sendErrno;
+        x.failed = s.failurePerMille != 0 && upTo(999) < s.failurePerMille;
         return 0;
     }
 
-    // Takes the request, lets the host answer it, and records the exchange.
+    // Takes the request, lets the scripted host answer it, records the exchange.
     int sendReceive(int fd) {
         Exchange x;
         if (begin(fd, x) != 0) return -1;
         SharedMemory& m = *x.memory;
-        // An overlapping exchange must not share the snapshot buffer with
-        // the one it overlaps.
+        // An overlapping exchange must not share the snapshot with the one it
+        // overlaps.
         std::vector<uint8_t> ownCopy(x.overlapped ? m.requestBytes : 0);
         uint8_t* taken = x.overlapped ? ownCopy.data() : m.taken.data();
         const uint32_t total = m.requestBytes >= 8 ? le32(m.view + 4) : 0;
@@ -340,8 +281,7 @@ class Device {
 
         bool rewritten = false;
         if (x.sendErrno == 0) {
-            const uint32_t delayUs = x.script->delayUs + x.extraDelayUs;
-            if (delayUs != 0) usleep(delayUs);
+            if (x.delayUs != 0) usleep(x.delayUs);
             if (x.hook) x.hook(x.requestLen >= 4 ? le32(taken) : 0);
             rewritten = x.requestLen != 0 && std::memcmp(taken, m.view, x.requestLen) != 0;
             x.replyLen =
@@ -361,7 +301,7 @@ class Device {
         ++mServed;
         mServedChanged.notify_all();
         const VmsgDeviceScript& s = *x.script;
-        if (!s.record && mTraceFd < 0 && !s.printCalls && !overlapped) return;
+        if (!s.record && mTrace == nullptr && !s.printCalls && !overlapped) return;
 
         VmsgDeviceExchange e;
         e.request.assign(taken, taken + x.requestLen);
@@ -377,47 +317,46 @@ class Device {
         e.sendErrno = x.sendErrno;
         e.overlapped = overlapped;
         report(e, s);
-        if (s.record) {
-            mExchanges.push_back(std::move(e));
-            mRecorded.notify_all();
-        }
-        VmsgDeviceEvent ev = event(VmsgDeviceEventKind::SendReceive, x.fd, VMSG_IOC_SEND_RECEIVE);
+        if (s.record) mExchanges.push_back(std::move(e));
+        VmsgDeviceEvent ev{Kind::SendReceive, x.fd, 0, VMSG_IOC_SEND_RECEIVE};
         errno = x.sendErrno;
         record(ev, x.sendErrno ? -1 : 0);
     }
 
     void report(const VmsgDeviceExchange& e, const VmsgDeviceScript& s) {
         if (e.overlapped)
-            writeAll(STDERR_FILENO, "vmsg-device: overlapping exchange: " + e.text + "\n");
-        if (s.printCalls) writeAll(STDERR_FILENO, e.text + "\n");
-        if (mTraceFd < 0) return;
-        const std::string reply =
-            e.sendErrno ? std::string("-") : hcallHex(e.reply.data(), e.reply.size());
-        writeAll(mTraceFd, "req=" + hcallHex(e.request.data(), e.request.size()) + " reply=" +
-                               reply + " " + e.text + (e.overlapped ? " !overlap" : "") + "\n");
+            std::fprintf(stderr, "vmsg-device: overlapping exchange: %s\n", e.text.c_str());
+        if (s.printCalls) std::fprintf(stderr, "%s\n", e.text.c_str());
+        if (mTrace == nullptr) return;
+        const std::string reply = e.sendErrno ? "-" : hcallHex(e.reply.data(), e.reply.size());
+        std::fprintf(mTrace, "req=%s reply=%s %s%s\n",
+                     hcallHex(e.request.data(), e.request.size()).c_str(), reply.c_str(),
+                     e.text.c_str(), e.overlapped ? " !overlap" : "");
+        std::fflush(mTrace);
     }
 
     void openTrace() {
-        if (mTraceFd >= 0) ::close(mTraceFd);
-        mTraceFd = -1;
+        if (mTrace != nullptr) std::fclose(mTrace);
         const std::string& path = mScript->tracePath;
-        if (path.empty()) return;
-        if (isDevicePath(path.c_str())) {
-            // Opening it here would come back to this device under its lock.
-            writeAll(STDERR_FILENO, "vmsg-device: the device cannot trace into itself\n");
-            return;
-        }
-        mTraceFd = ::open(path.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644);
-        if (mTraceFd < 0) writeAll(STDERR_FILENO, "vmsg-device: cannot open trace " + path + "\n");
+        // Opening the device itself would come back here under the lock.
+        mTrace =
+            path.empty() || isDevicePath(path.c_str()) ? nullptr : std::fopen(path.c_str(), "ae");
+        if (mTrace == nullptr && !path.empty())
+            std::fprintf(stderr, "vmsg-device: cannot trace into %s\n", path.c_str());
     }
 
     std::mutex mMutex;
     uint64_t mSeq = 0;
-    Random mRandom;
-    int mTraceFd = -1;
+    std::mt19937_64 mRandom;  // its sequence is the same on every platform
+    FILE* mTrace = nullptr;
 };
 
-Device& device() { return Device::get(); }
+// Never destroyed: the client disconnects from static destructors that may
+// run after ours would have.
+Device& device() {
+    static Device* device = new Device;
+    return *device;
+}
 
 }  // namespace
 
@@ -425,10 +364,7 @@ bool isDevicePath(const char* path) {
     return path != nullptr && std::strcmp(path, VMSG_DEVICE_PATH) == 0;
 }
 
-bool isDeviceFd(int fd) {
-    if (fd < 0 || fd >= kMaxFd) return false;
-    return (gDeviceFds[fd / 64].load(std::memory_order_acquire) >> (fd % 64)) & 1;
-}
+bool isDeviceFd(int fd) { return fd >= 0 && fd < kMaxFd && gDeviceFds[fd].load(); }
 
 int openDevice(int flags) { return device().open(flags); }
 int deviceIoctl(int fd, unsigned long request, void* arg) {
@@ -438,36 +374,18 @@ int closeDevice(int fd, int (*realClose)(int)) { return device().close(fd, realC
 
 }  // namespace vmsgdev
 
+using vmsgdev::Device;
 using vmsgdev::device;
 
+// clang-format off
 void vmsgDeviceConfigure(const VmsgDeviceScript& script) { device().configure(script); }
-VmsgDeviceScript vmsgDeviceScript() {
-    return device().read([] { return *device().mScript; });
-}
+VmsgDeviceScript vmsgDeviceScript() { return *device().copy(&Device::mScript); }
 void vmsgDeviceReset() { device().reset(); }
-std::vector<VmsgDeviceExchange> vmsgDeviceExchanges() {
-    return device().read([] { return device().mExchanges; });
-}
-std::vector<VmsgDeviceEvent> vmsgDeviceEvents() {
-    return device().read([] { return device().mEvents; });
-}
-size_t vmsgDeviceOverlapCount() {
-    return device().read([] { return device().mOverlaps; });
-}
-bool vmsgDeviceWaitForExchanges(size_t count, uint32_t timeoutMs) {
-    return device().waitFor(device().mRecorded, timeoutMs,
-                            [count] { return device().mExchanges.size() >= count; });
-}
-size_t vmsgDeviceOpenCount() {
-    return device().read([] { return device().mConnections.size(); });
-}
-uint64_t vmsgDeviceServedCount() {
-    return device().read([] { return device().mServed; });
-}
-bool vmsgDeviceWaitForServed(uint64_t count, uint32_t timeoutMs) {
-    return device().waitFor(device().mServedChanged, timeoutMs,
-                            [count] { return device().mServed >= count; });
-}
-void vmsgDeviceSetHostHook(std::function<void(uint32_t)> hook) {
-    device().read([&hook] { device().mHook = std::move(hook); });
-}
+std::vector<VmsgDeviceExchange> vmsgDeviceExchanges() { return device().copy(&Device::mExchanges); }
+std::vector<VmsgDeviceEvent> vmsgDeviceEvents() { return device().copy(&Device::mEvents); }
+size_t vmsgDeviceOverlapCount() { return device().copy(&Device::mOverlaps); }
+size_t vmsgDeviceOpenCount() { return device().copy(&Device::mConnections).size(); }
+uint64_t vmsgDeviceServedCount() { return device().copy(&Device::mServed); }
+bool vmsgDeviceWaitForServed(uint64_t count, uint32_t timeoutMs) { return device().waitForServed(count, timeoutMs); }
+void vmsgDeviceSetHostHook(std::function<void(uint32_t)> hook) { device().setHook(std::move(hook)); }
+// clang-format on

@@ -1,8 +1,10 @@
-#include "VmsgDeviceReply.h"
-
+// The scripted host's reply, or the broken one the script asks for instead.
 #include <algorithm>
 #include <cstring>
+#include <random>
 #include <vector>
+
+#include "VmsgDeviceInternal.h"
 
 namespace vmsgdev {
 namespace {
@@ -20,7 +22,6 @@ class ScriptedHost : public HcallHandler {
         if (it != mScript.results.end()) return it->second;
         return flag ? int32_t(mScript.launchAllowed) : mScript.defaultResult;
     }
-    int32_t malformed(const HcallRequest&) override { return mScript.malformedResult; }
     int32_t hcallGetPropsRpc(char* buffer, int32_t length, int32_t* value) override {
         fill(buffer, length, mScript.propsText);
         *value = mScript.propsValue;
@@ -43,13 +44,8 @@ class ScriptedHost : public HcallHandler {
 };
 
 uint32_t writeGarbage(uint8_t* out, uint32_t capacity, uint64_t seed) {
-    uint64_t x = seed * 0x9E3779B97F4A7C15ULL + 0x2545F4914F6CDD1DULL;
-    for (uint32_t i = 0; i < capacity; ++i) {
-        x ^= x << 13;
-        x ^= x >> 7;
-        x ^= x << 17;
-        out[i] = uint8_t(x >> 32);
-    }
+    std::mt19937_64 noise(seed);
+    for (uint32_t i = 0; i < capacity; ++i) out[i] = uint8_t(noise() >> 56);
     return capacity;
 }
 
