@@ -13,8 +13,8 @@
 
 #include "DeviceSession.h"
 #include "LogRecorder.h"
-#include "hcall/guest/HcallCall.h"
 #include "hcall/host/HcallHost.h"
+#include "support/HcallInvoke.h"
 
 namespace {
 
@@ -85,7 +85,7 @@ struct GuestCall {
     std::unique_ptr<char[]> buffers[hcall::kMaxParams];
 
     template <hcall::Kind K>
-    auto pass(size_t i) {
+    auto get(size_t i) {
         HcallValue& v = values.params[i];
         if constexpr (K == hcall::Str) {
             return v.text.data();
@@ -102,23 +102,6 @@ struct GuestCall {
         } else {
             return &v.u64;
         }
-    }
-    template <uint32_t Code, size_t... I>
-    int32_t invoke(typename hcall::Op<Code>::Function fn, std::index_sequence<I...>) {
-        return int32_t(fn(pass<hcall::Op<Code>::template kind<I>>(I)...));
-    }
-    // Calls the exported operation; a bool result comes back as 0 or 1.
-    int32_t call() {
-        using Caller = int32_t (*)(GuestCall&);
-        static constexpr Caller kCallers[] = {
-#define GOLDEN_CALLER(code, name, result, sig, params)                                      \
-    [](GuestCall& c) {                                                                      \
-        return c.invoke<code>(&name, std::make_index_sequence<hcall::Op<code>::kParams>()); \
-    },
-            HCALL_CATALOGUE(GOLDEN_CALLER)
-#undef GOLDEN_CALLER
-        };
-        return kCallers[values.opCode - 1](*this);
     }
 };
 
@@ -168,7 +151,7 @@ TEST_F(HcallGolden, Guest_SendsEveryRowAndReadsItsReply) {
         ASSERT_TRUE(values.ok()) << hcallFaultText(values);
 
         GuestCall guest{values, {}};
-        const int32_t result = guest.call();
+        const int32_t result = int32_t(hcalltest::invokeExported(values.opCode, guest));
 
         EXPECT_EQ(onlyExchange().request, row.request) << "the bytes the guest sent";
         std::vector<uint8_t> received(row.reply.size());

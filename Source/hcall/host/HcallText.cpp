@@ -12,7 +12,7 @@ __attribute__((format(printf, 1, 2))) std::string format(const char* fmt, ...) {
     char line[160];
     va_list ap;
     va_start(ap, fmt);
-    vsnprintf(line, sizeof line, fmt, ap);
+    (void)vsnprintf(line, sizeof line, fmt, ap);  // every message fits the line
     va_end(ap);
     return line;
 }
