@@ -8,7 +8,6 @@
 
 #include <cerrno>
 #include <cstring>
-#include <functional>
 #include <string>
 
 #include "DeviceSession.h"
