@@ -15,6 +15,7 @@
 #include "VmsgDeviceModel.h"
 #include "hcall/guest/HcallCall.h"
 #include "hcall/guest/HcallEnc.h"
+#include "support/HcallInvoke.h"
 
 namespace fuzz {
 
@@ -85,25 +86,19 @@ auto pass(Arg& a) {
     }
 }
 
-template <uint32_t Code, size_t... I>
-int64_t invokeWith(typename hcall::Op<Code>::Function fn, Arg* args, std::index_sequence<I...>) {
-    (void)args;  // an operation without parameters passes nothing
-    return int64_t(fn(pass<hcall::Op<Code>::template kind<I>>(args[I])...));
-}
+// The arguments of a drawn call as the operation takes them.
+struct CallArgs {
+    Arg* args;
+    template <hcall::Kind K>
+    auto get(size_t i) {
+        return pass<K>(args[i]);
+    }
+};
 
 // Calls the exported operation; a bool result comes back as 0 or 1.
 inline int64_t invoke(Call& call) {
-    using Invoker = int64_t (*)(Arg*);
-    static constexpr Invoker kInvokers[] = {
-#define FUZZ_INVOKER(code, name, result, sig, params)                                            \
-    [](Arg* a) {                                                                                 \
-        return invokeWith<code>(&name, a, std::make_index_sequence<hcall::Op<code>::kParams>()); \
-    },
-        HCALL_CATALOGUE(FUZZ_INVOKER)
-#undef FUZZ_INVOKER
-    };
-    static_assert(sizeof(kInvokers) / sizeof(kInvokers[0]) == hcall::kNumOps, "one per operation");
-    return kInvokers[call.op->code - 1](call.args);
+    CallArgs args{call.args};
+    return hcalltest::invokeExported(call.op->code, args);
 }
 
 // What the call answers when the host is not asked or does not answer.

@@ -1,7 +1,8 @@
-// The host's decoder fed any bytes: a request (as long as its totalLength
+// The host half's parser fed any bytes: a request (as long as its totalLength
 // says, or all of the input) followed by a reply. Checked against a reading of
 // the wire rules written here, at capacities around the request's own sizes;
-// the hex helpers of the decode tool get the same bytes as text.
+// a reply read back must build the same bytes, and the hex helpers of the
+// decode tool get the same bytes as text.
 #include <algorithm>
 #include <cctype>
 #include <cstring>
@@ -10,7 +11,7 @@
 #include <vector>
 
 #include "FuzzCheck.h"
-#include "HcallDecoder.h"
+#include "hcall/host/HcallHost.h"
 
 namespace {
 
@@ -29,7 +30,6 @@ struct Exact {
 struct Reading {
     bool wellFormed = false;
     uint64_t replySize = 0;
-    int numFilled = 0;
 };
 
 // The wire rules: a known code; totalLength from the header to within what
@@ -66,13 +66,11 @@ Reading readByRules(const uint8_t* req, size_t len, uint32_t hostCap, uint32_t g
             case hcall::Buf:
                 if (w > 0x7FFFFFFF) return r;
                 reply += w;
-                ++r.numFilled;
                 break;
             case hcall::OutI32:
             case hcall::OutU64:
                 if (w != (op->params[i] == hcall::OutI32 ? 4u : 8u)) return r;
                 reply += w;
-                ++r.numFilled;
                 break;
         }
     }
@@ -89,29 +87,44 @@ bool endsWith(const std::string& s, const std::string& tail) {
     return s.size() >= tail.size() && s.compare(s.size() - tail.size(), tail.size(), tail) == 0;
 }
 
-// One decoding, against the rules; the answer shown when a reply was given.
+// A reply read into the request's values builds back the bytes it came from;
+// a bool result comes back as 01 or 00 in its first byte.
+void checkRebuilt(HcallRequest request, const uint8_t* reply) {
+    int32_t result = 0;
+    expect(hcallReadReply(request, reply, request.replySize, result), "a whole reply reads");
+    std::vector<uint8_t> built(request.replySize);
+    expect(hcallBuildReply(request, result, built.data(), built.size()) == request.replySize,
+           "the reply fits its own size");
+    std::vector<uint8_t> want(reply, reply + request.replySize);
+    if (request.op->result == hcall::Flag) {
+        uint8_t* word = want.data() + want.size() - 4;
+        word[0] = word[0] != 0 ? 1 : 0;
+        word[1] = word[2] = word[3] = 0;
+    }
+    expect(built == want, "the reply builds back from what was read");
+}
+
+// One parse, against the rules; the answer shown when a reply was given.
 Reading decodeAt(const Exact& req, const Exact* reply, uint32_t hostCap, uint32_t guestCap) {
     const Reading want = readByRules(req.bytes.get(), req.size, hostCap, guestCap);
-    const HcallDecoded d =
-        hcallDecode(req.bytes.get(), req.size, reply ? reply->bytes.get() : nullptr,
-                    reply ? reply->size : 0, hostCap, guestCap);
-    const HcallDecoded c = hcallCheck(req.bytes.get(), req.size, hostCap, guestCap);
-    expect(d.wellFormed == want.wellFormed, "the decoder accepts exactly what the rules allow");
-    expect(c.wellFormed == d.wellFormed && c.problem == d.problem, "check and decode agree");
-    expect(d.wellFormed == d.problem.empty(), "a rejected request says why");
-    expect(!d.text.empty(), "every request gets a line");
-    if (!d.wellFormed) return want;
-    expect(d.replySize == want.replySize && d.numFilled == want.numFilled,
-           "the reply's size is the filled sizes and the result");
+    const HcallRequest r = hcallParseRequest(req.bytes.get(), req.size, {hostCap, guestCap});
+    const std::string text =
+        reply ? hcallExchangeText(r, reply->bytes.get(), reply->size) : hcallCallText(r);
+    expect(r.ok() == want.wellFormed, "the parser accepts exactly what the rules allow");
+    expect(r.ok() == hcallFaultText(r).empty(), "a rejected request says why");
+    expect(!text.empty(), "every request gets a line");
+    if (!r.ok()) return want;
+    expect(r.replySize == want.replySize, "the reply's size is the filled sizes and the result");
     if (reply == nullptr) return want;
-    if (reply->size < d.replySize) {
-        expect(d.text.find(" -> !short reply: ") != std::string::npos, "a short reply is told");
+    if (reply->size < r.replySize) {
+        expect(text.find(" -> !short reply: ") != std::string::npos, "a short reply is told");
     } else {
-        const uint8_t* result = reply->bytes.get() + d.replySize - 4;
-        const std::string shown = d.op->result == hcall::Flag
+        const uint8_t* result = reply->bytes.get() + r.replySize - 4;
+        const std::string shown = r.op->result == hcall::Flag
                                       ? (result[0] ? " -> true" : " -> false")
                                       : " -> " + std::to_string(int32_t(le32(result)));
-        expect(endsWith(d.text, shown), "the answer shown is the reply's last word");
+        expect(endsWith(text, shown), "the answer shown is the reply's last word");
+        checkRebuilt(r, reply->bytes.get());
     }
     return want;
 }

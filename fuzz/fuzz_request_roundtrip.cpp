@@ -8,7 +8,7 @@
 
 #include "FuzzCalls.h"
 #include "FuzzLogger.h"
-#include "HcallDecoder.h"
+#include "hcall/host/HcallHost.h"
 
 namespace {
 
@@ -50,7 +50,7 @@ std::vector<uint8_t> referenceRequest(const fuzz::Call& call) {
     return out;
 }
 
-// The call as the host's decoder renders it.
+// The call as the host half renders it.
 std::string referenceText(const fuzz::Call& call) {
     std::string text = std::string(call.op->name) + "(";
     for (int i = 0; i < call.op->numParams; ++i) {
@@ -105,8 +105,7 @@ void checkReply(const VmsgDeviceScript& s, const fuzz::Call& call, int64_t resul
     const auto listed = s.results.find(call.op->code);
     int64_t want = call.op->result == hcall::Flag ? int64_t(s.launchAllowed) : s.defaultResult;
     if (listed != s.results.end())
-        want =
-            call.op->result == hcall::Flag ? int64_t((listed->second & 0xFF) != 0) : listed->second;
+        want = call.op->result == hcall::Flag ? int64_t(listed->second != 0) : listed->second;
     expect(result == want, "the guest returns the host's result");
 }
 
@@ -136,11 +135,11 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     expect(exchanges.size() == 1, "one call, one exchange");
     const VmsgDeviceExchange& x = exchanges[0];
     expect(x.request == referenceRequest(call), "the request bytes follow the wire rules");
-    const HcallDecoded d = hcallDecode(x.request.data(), x.request.size(), nullptr, 0,
-                                       script.hostBoundCapacity, script.guestBoundCapacity);
-    expect(d.wellFormed && d.opCode == call.op->code, "the host decodes the request as sent");
-    expect(d.replySize == fuzz::expectedSizes(call).reply, "the host expects the reply's size");
-    expect(d.text == referenceText(call), "the decoded arguments are the ones passed");
+    const HcallRequest r = hcallParseRequest(x.request.data(), x.request.size(),
+                                             {script.hostBoundCapacity, script.guestBoundCapacity});
+    expect(r.ok() && r.opCode == call.op->code, "the host reads the request as sent");
+    expect(r.replySize == fuzz::expectedSizes(call).reply, "the host expects the reply's size");
+    expect(hcallCallText(r) == referenceText(call), "the values read are the ones passed");
     checkReply(script, call, result);
     return 0;
 }

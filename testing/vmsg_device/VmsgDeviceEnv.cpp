@@ -1,178 +1,139 @@
-// Start-up script of a preloaded device, read from the environment:
-//
-//   VMSG_DEVICE_CAPACITY=n         both buffer capacities (default 65536)
-//   VMSG_DEVICE_HOST_CAPACITY=n    host-bound capacity alone
-//   VMSG_DEVICE_GUEST_CAPACITY=n   guest-bound capacity alone
-//   VMSG_DEVICE_GUEST_OFFSET=n     guest-bound offset (default: after the host-bound
-//                                  buffer, page-rounded)
-//   VMSG_DEVICE_SPARE=n            the spare out-word of CONNECT
-//   VMSG_DEVICE_RESULTS=12=-5,24=0 result per operation code
-//   VMSG_DEVICE_DEFAULT_RESULT=n   result of every other operation (default 0)
-//   VMSG_DEVICE_LAUNCH_ALLOWED=0|1 answer of operation 24 unless RESULTS names it (default 1)
-//   VMSG_DEVICE_PROPS=text  VMSG_DEVICE_PROPS_VALUE=n     filled data of operation 1
-//   VMSG_DEVICE_TIME=n      VMSG_DEVICE_TIME_TEXT=text    filled data of operation 5
-//   VMSG_DEVICE_DELAY_US=n         pause before each reply
-//   VMSG_DEVICE_DELAY_JITTER_US=n  a further random pause of 0 to n
-//   VMSG_DEVICE_FAIL_PER_MILLE=n   answer n of every 1000 exchanges, at random, with
-//   VMSG_DEVICE_FAIL_RESULT=n        this result (default 5)
-//   VMSG_DEVICE_SEND_FAIL_PER_MILLE=n  fail n of every 1000 SEND_RECEIVE with EIO
-//   VMSG_DEVICE_SEED=n             seed of those random choices (default 1)
-//   VMSG_DEVICE_FAIL=open|connect|mmap|send[:errno]   inject one failure
-//   VMSG_DEVICE_REPLY=short:n|garbage|raw:hex          replace the proper reply
-//   VMSG_DEVICE_TRACE=/path        append one line per exchange
-//   VMSG_DEVICE_PRINT=1            print each decoded call on standard error
-//   VMSG_DEVICE_RECORD=0           keep no exchanges in memory
-//
-// Numbers are decimal or 0x-prefixed hex.
+// The start-up script of a preloaded device, read from the VMSG_DEVICE_*
+// environment variables that README.md lists. Numbers are decimal or
+// 0x-prefixed hex; an unreadable value is reported and ignored.
 #include <errno.h>
 
+#include <algorithm>
 #include <cstdio>
 #include <cstdlib>
-#include <cstring>
 #include <string>
 
-#include "HcallDecoder.h"
 #include "VmsgDeviceInternal.h"
 
 namespace vmsgdev {
 namespace {
 
-bool parseNumber(const std::string& text, long long lo, long long hi, long long& value) {
-    if (text.empty()) return false;
+// A whole number within [lo, hi], unsigned 64-bit when hi says so.
+bool parseNumber(const std::string& text, long long lo, unsigned long long hi,
+                 unsigned long long& value) {
     errno = 0;
     char* end = nullptr;
-    const long long v = std::strtoll(text.c_str(), &end, 0);
-    if (errno != 0 || *end != '\0' || v < lo || v > hi) return false;
-    value = v;
-    return true;
-}
-
-void complain(const char* name, const char* value) {
-    std::fprintf(stderr, "vmsg-device: ignoring %s=%s\n", name, value);
-}
-
-// Reads one variable into a field through a parser; unset leaves the field.
-template <typename Parse>
-void readVar(const char* name, Parse parse) {
-    const char* value = std::getenv(name);
-    if (value != nullptr && !parse(std::string(value))) complain(name, value);
+    const bool negative = text.find('-') != std::string::npos;
+    value = negative ? (unsigned long long)std::strtoll(text.c_str(), &end, 0)
+                     : std::strtoull(text.c_str(), &end, 0);
+    return !text.empty() && errno == 0 && *end == '\0' &&
+           (negative ? (long long)value >= lo : value <= hi);
 }
 
 template <typename T>
-void readNumber(const char* name, T& field, long long lo, long long hi) {
-    readVar(name, [&](const std::string& text) {
-        long long v = 0;
-        if (!parseNumber(text, lo, hi, v)) return false;
-        field = T(v);
-        return true;
-    });
-}
-
-void readU32(const char* name, uint32_t& field) { readNumber(name, field, 0, 0xFFFFFFFFLL); }
-void readI32(const char* name, int32_t& field) { readNumber(name, field, INT32_MIN, INT32_MAX); }
-
-void readText(const char* name, std::string& field) {
-    readVar(name, [&](const std::string& text) {
-        field = text;
-        return true;
-    });
-}
-
-bool parseFail(const std::string& text, VmsgDeviceScript& s) {
-    const size_t colon = text.find(':');
-    const std::string what = text.substr(0, colon);
-    long long err = 0;
-    if (colon != std::string::npos && !parseNumber(text.substr(colon + 1), 1, 4095, err))
-        return false;
-    if (what == "open") {
-        s.openErrno = err ? int(err) : ENOENT;
-    } else if (what == "connect") {
-        s.connectErrno = err ? int(err) : EIO;
-    } else if (what == "send") {
-        s.sendErrno = err ? int(err) : EIO;
-    } else if (what == "mmap" && colon == std::string::npos) {
-        s.mmapFails = true;
-    } else {
-        return false;
-    }
+bool parse(const std::string& text, T& field, long long lo, unsigned long long hi) {
+    unsigned long long v = 0;
+    if (!parseNumber(text, lo, hi, v)) return false;
+    field = T(v);
     return true;
 }
-
-bool parseReply(const std::string& text, VmsgDeviceScript& s) {
-    long long n = 0;
-    if (text == "garbage") {
-        s.replyMode = VmsgDeviceReplyMode::Garbage;
-    } else if (text.rfind("short:", 0) == 0 && parseNumber(text.substr(6), 0, 0xFFFFFFFFLL, n)) {
-        s.replyMode = VmsgDeviceReplyMode::Short;
-        s.shortReplyBytes = uint32_t(n);
-    } else if (text.rfind("raw:", 0) == 0 && hcallParseHex(text.substr(4), s.rawReply)) {
-        s.replyMode = VmsgDeviceReplyMode::Raw;
-    } else {
-        return false;
-    }
+bool parse(const std::string& text, uint32_t& field) { return parse(text, field, 0, UINT32_MAX); }
+bool parse(const std::string& text, uint64_t& field) { return parse(text, field, 0, UINT64_MAX); }
+bool parse(const std::string& text, int32_t& field) {
+    return parse(text, field, INT32_MIN, INT32_MAX);
+}
+bool parse(const std::string& text, std::string& field) {
+    field = text;
     return true;
 }
-
-bool parseSwitch(const std::string& text, bool& field) {
+bool parse(const std::string& text, bool& field) {
     if (text != "0" && text != "1") return false;
     field = text == "1";
     return true;
 }
 
-}  // namespace
-
-bool parseResults(const std::string& text, std::map<uint32_t, int32_t>& results) {
-    size_t start = 0;
-    while (start <= text.size()) {
+// "12=-5,24=0": a result per operation code.
+bool parse(const std::string& text, std::map<uint32_t, int32_t>& results) {
+    for (size_t start = 0; start <= text.size();) {
         const size_t comma = std::min(text.find(',', start), text.size());
         const std::string item = text.substr(start, comma - start);
         const size_t eq = item.find('=');
-        long long code = 0, result = 0;
-        if (eq == std::string::npos || !parseNumber(item.substr(0, eq), 1, 0xFFFFFFFFLL, code) ||
-            !parseNumber(item.substr(eq + 1), INT32_MIN, 0xFFFFFFFFLL, result))
+        uint32_t code = 0, result = 0;
+        if (eq == std::string::npos || !parse(item.substr(0, eq), code, 1, UINT32_MAX) ||
+            !parse(item.substr(eq + 1), result, INT32_MIN, UINT32_MAX))
             return false;
-        results[uint32_t(code)] = int32_t(uint32_t(result));
+        results[code] = int32_t(result);
         start = comma + 1;
     }
     return true;
 }
 
+// open|connect|mmap|send[:errno]
+bool parseFault(const std::string& text, VmsgDeviceScript& s) {
+    const size_t colon = text.find(':');
+    const std::string what = text.substr(0, colon);
+    int err = 0;
+    if (colon != std::string::npos && !parse(text.substr(colon + 1), err, 1, 4095)) return false;
+    if (what == "open") s.openErrno = err ? err : ENOENT;
+    if (what == "connect") s.connectErrno = err ? err : EIO;
+    if (what == "send") s.sendErrno = err ? err : EIO;
+    if (what == "mmap") s.mmapFails = colon == std::string::npos;
+    return what == "open" || what == "connect" || what == "send" || s.mmapFails;
+}
+
+// short:N|garbage|raw:HEX
+bool parseReply(const std::string& text, VmsgDeviceScript& s) {
+    if (text == "garbage") {
+        s.replyMode = VmsgDeviceReplyMode::Garbage;
+    } else if (text.rfind("short:", 0) == 0 && parse(text.substr(6), s.shortReplyBytes)) {
+        s.replyMode = VmsgDeviceReplyMode::Short;
+    } else if (text.rfind("raw:", 0) == 0 && hcallParseHex(text.substr(4), s.rawReply)) {
+        s.replyMode = VmsgDeviceReplyMode::Raw;
+    }
+    return s.replyMode != VmsgDeviceReplyMode::Scripted;
+}
+
+// Reads one variable through a parser; an unset variable leaves the script.
+template <typename Parse>
+void readWith(const char* name, Parse parse) {
+    const char* value = std::getenv(name);
+    if (value != nullptr && !parse(std::string(value)))
+        std::fprintf(stderr, "vmsg-device: ignoring %s=%s\n", name, value);
+}
+
+template <typename T>
+void read(const char* name, T& field) {
+    readWith(name, [&field](const std::string& text) { return parse(text, field); });
+}
+
+void readPerMille(const char* name, uint32_t& field) {
+    readWith(name, [&field](const std::string& text) { return parse(text, field, 0, 1000); });
+}
+
+}  // namespace
+
 VmsgDeviceScript scriptFromEnvironment() {
     VmsgDeviceScript s;
     uint32_t capacity = 0;
-    readU32("VMSG_DEVICE_CAPACITY", capacity);
+    read("VMSG_DEVICE_CAPACITY", capacity);
     if (capacity != 0) s.hostBoundCapacity = s.guestBoundCapacity = capacity;
-    readU32("VMSG_DEVICE_HOST_CAPACITY", s.hostBoundCapacity);
-    readU32("VMSG_DEVICE_GUEST_CAPACITY", s.guestBoundCapacity);
-    readU32("VMSG_DEVICE_GUEST_OFFSET", s.guestBoundOffset);
-    readU32("VMSG_DEVICE_SPARE", s.spare);
-    readVar("VMSG_DEVICE_RESULTS",
-            [&](const std::string& text) { return parseResults(text, s.results); });
-    readI32("VMSG_DEVICE_DEFAULT_RESULT", s.defaultResult);
-    readVar("VMSG_DEVICE_LAUNCH_ALLOWED",
-            [&](const std::string& text) { return parseSwitch(text, s.launchAllowed); });
-    readText("VMSG_DEVICE_PROPS", s.propsText);
-    readI32("VMSG_DEVICE_PROPS_VALUE", s.propsValue);
-    readVar("VMSG_DEVICE_TIME", [&](const std::string& text) {
-        errno = 0;
-        char* end = nullptr;
-        s.timeValue = std::strtoull(text.c_str(), &end, 0);
-        return !text.empty() && errno == 0 && *end == '\0';
-    });
-    readText("VMSG_DEVICE_TIME_TEXT", s.timeText);
-    readU32("VMSG_DEVICE_DELAY_US", s.delayUs);
-    readU32("VMSG_DEVICE_DELAY_JITTER_US", s.delayJitterUs);
-    readNumber("VMSG_DEVICE_FAIL_PER_MILLE", s.failurePerMille, 0, 1000);
-    readI32("VMSG_DEVICE_FAIL_RESULT", s.failureResult);
-    readNumber("VMSG_DEVICE_SEND_FAIL_PER_MILLE", s.sendFailurePerMille, 0, 1000);
-    readNumber("VMSG_DEVICE_SEED", s.randomSeed, 0, INT64_MAX);
-    readVar("VMSG_DEVICE_FAIL", [&](const std::string& text) { return parseFail(text, s); });
-    readVar("VMSG_DEVICE_REPLY", [&](const std::string& text) { return parseReply(text, s); });
-    readText("VMSG_DEVICE_TRACE", s.tracePath);
-    readVar("VMSG_DEVICE_PRINT",
-            [&](const std::string& text) { return parseSwitch(text, s.printCalls); });
-    readVar("VMSG_DEVICE_RECORD",
-            [&](const std::string& text) { return parseSwitch(text, s.record); });
+    read("VMSG_DEVICE_HOST_CAPACITY", s.hostBoundCapacity);
+    read("VMSG_DEVICE_GUEST_CAPACITY", s.guestBoundCapacity);
+    read("VMSG_DEVICE_GUEST_OFFSET", s.guestBoundOffset);
+    read("VMSG_DEVICE_SPARE", s.spare);
+    read("VMSG_DEVICE_RESULTS", s.results);
+    read("VMSG_DEVICE_DEFAULT_RESULT", s.defaultResult);
+    read("VMSG_DEVICE_LAUNCH_ALLOWED", s.launchAllowed);
+    read("VMSG_DEVICE_PROPS", s.propsText);
+    read("VMSG_DEVICE_PROPS_VALUE", s.propsValue);
+    read("VMSG_DEVICE_TIME", s.timeValue);
+    read("VMSG_DEVICE_TIME_TEXT", s.timeText);
+    read("VMSG_DEVICE_DELAY_US", s.delayUs);
+    read("VMSG_DEVICE_DELAY_JITTER_US", s.delayJitterUs);
+    readPerMille("VMSG_DEVICE_FAIL_PER_MILLE", s.failurePerMille);
+    read("VMSG_DEVICE_FAIL_RESULT", s.failureResult);
+    readPerMille("VMSG_DEVICE_SEND_FAIL_PER_MILLE", s.sendFailurePerMille);
+    read("VMSG_DEVICE_SEED", s.randomSeed);
+    readWith("VMSG_DEVICE_FAIL", [&s](const std::string& text) { return parseFault(text, s); });
+    readWith("VMSG_DEVICE_REPLY", [&s](const std::string& text) { return parseReply(text, s); });
+    read("VMSG_DEVICE_TRACE", s.tracePath);
+    read("VMSG_DEVICE_PRINT", s.printCalls);
+    read("VMSG_DEVICE_RECORD", s.record);
     return s;
 }
 

@@ -9,30 +9,26 @@
 #include <atomic>
 #include <chrono>
 #include <condition_variable>
+#include <cstdio>
 #include <cstring>
 #include <memory>
 #include <mutex>
+#include <random>
 
-#include "HcallDecoder.h"
 #include "VmsgDeviceInternal.h"
-#include "VmsgDeviceReply.h"
+#include "hcall/host/HcallBytes.h"
 #include "vmsg/guest/VmsgDevice.h"
 
 namespace vmsgdev {
 namespace {
 
+using hcall::le32;
+using Kind = VmsgDeviceEventKind;
+
 // Which descriptors are the device's, readable without a lock because every
 // close() and ioctl() in the process asks.
 constexpr int kMaxFd = 65536;
-std::atomic<uint64_t> gDeviceFds[kMaxFd / 64];
-
-void markDeviceFd(int fd, bool on) {
-    const uint64_t bit = uint64_t(1) << (fd % 64);
-    if (on)
-        gDeviceFds[fd / 64].fetch_or(bit, std::memory_order_release);
-    else
-        gDeviceFds[fd / 64].fetch_and(~bit, std::memory_order_release);
-}
+std::atomic<bool> gDeviceFds[kMaxFd];
 
 // Layouts larger than this are answered on CONNECT but never backed: the
 // client's mapping of such a size is its own business, and the host serves
@@ -45,9 +41,9 @@ constexpr uint64_t kMaxBackedLayout = uint64_t(256) << 20;
 struct SharedMemory {
     uint8_t* view = nullptr;
     size_t length = 0;
+    HcallLimits limits;          // the connection's capacities
     uint32_t requestBytes = 0;   // readable host-bound bytes
     uint32_t guestOffset = 0;    // where the reply goes
-    uint32_t replyBytes = 0;     // writable guest-bound bytes
     std::vector<uint8_t> taken;  // the request as the host took it
     ~SharedMemory() {
         if (view != nullptr) munmap(view, length);
@@ -56,68 +52,29 @@ struct SharedMemory {
 
 struct Connection {
     bool connected = false;
-    uint32_t hostBoundCapacity = 0;
-    uint32_t guestBoundCapacity = 0;
     int inFlight = 0;
     std::shared_ptr<SharedMemory> memory;  // null when the layout is not backed
 };
-
-uint32_t le32(const uint8_t* p) {
-    return uint32_t(p[0]) | uint32_t(p[1]) << 8 | uint32_t(p[2]) << 16 | uint32_t(p[3]) << 24;
-}
-
-void putLe32(uint8_t* p, uint32_t v) {
-    for (int i = 0; i < 4; ++i) p[i] = uint8_t(v >> (8 * i));
-}
 
 int fail(int err) {
     errno = err;
     return -1;
 }
 
-void writeAll(int fd, const std::string& text) {
-    size_t done = 0;
-    while (done < text.size()) {
-        const ssize_t n = write(fd, text.data() + done, text.size() - done);
-        if (n < 0 && errno == EINTR) continue;
-        if (n <= 0) break;
-        done += size_t(n);
-    }
-}
-
-// What one exchange carries from its start to its record.
+// What one exchange carries from its start to its record: copied or shared
+// under the lock, so that the host serves it with the lock released.
 struct Exchange {
     int fd = -1;
     std::shared_ptr<const VmsgDeviceScript> script;
     std::shared_ptr<SharedMemory> memory;
     std::function<void(uint32_t)> hook;
-    uint32_t hostBoundCapacity = 0;
-    uint32_t guestBoundCapacity = 0;
     uint64_t seq = 0;
     bool overlapped = false;
+    int sendErrno = 0;
+    uint32_t delayUs = 0;
+    bool failed = false;  // answered with the script's failure result
     uint32_t requestLen = 0;
     uint32_t replyLen = 0;
-    int sendErrno = 0;
-    uint32_t extraDelayUs = 0;  // drawn at random
-    bool failed = false;        // answered with the script's failure result
-};
-
-// splitmix64: small, fast, and the same sequence on every platform.
-class Random {
-  public:
-    void seed(uint64_t seed) { mState = seed; }
-    uint64_t next() {
-        uint64_t z = (mState += 0x9E3779B97F4A7C15ULL);
-        z = (z ^ (z >> 30)) * 0xBF58476D1CE4E5B9ULL;
-        z = (z ^ (z >> 27)) * 0x94D049BB133111EBULL;
-        return z ^ (z >> 31);
-    }
-    // Uniform enough in [0, bound] for pauses and shares.
-    uint32_t upTo(uint32_t bound) { return uint32_t(next() % (uint64_t(bound) + 1)); }
-    bool perMille(uint32_t share) { return share != 0 && upTo(999) < share; }
-
-  private:
-    uint64_t mState = 0;
 };
 
 class Device {
@@ -127,81 +84,52 @@ class Device {
         openTrace();
     }
 
-    static Device& get() {
-        // Never destroyed: the client disconnects from static destructors
-        // that may run after ours would have.
-        static Device* device = new Device;
-        return *device;
-    }
-
     int open(int flags) {
         std::lock_guard<std::mutex> lock(mMutex);
-        VmsgDeviceEvent ev;
-        ev.kind = VmsgDeviceEventKind::Open;
-        ev.openFlags = flags;
-        int fd = -1;
-        if (mScript->openErrno != 0) {
-            fd = fail(mScript->openErrno);
-        } else {
-            fd = memfd_create("kivvmsg",
-                              MFD_ALLOW_SEALING | ((flags & O_CLOEXEC) ? MFD_CLOEXEC : 0));
-            if (fd >= kMaxFd) {
-                ::close(fd);
-                fd = fail(EMFILE);
-            }
+        const unsigned cloexec = (flags & O_CLOEXEC) ? MFD_CLOEXEC : 0;
+        int fd = mScript->openErrno != 0 ? fail(mScript->openErrno)
+                                         : memfd_create("kivvmsg", MFD_ALLOW_SEALING | cloexec);
+        if (fd >= kMaxFd) {
+            ::close(fd);
+            fd = fail(EMFILE);
         }
         if (fd >= 0) {
             mConnections[fd] = Connection{};
-            markDeviceFd(fd, true);
+            gDeviceFds[fd].store(true);
         }
-        ev.fd = ev.result = fd;
-        ev.error = fd < 0 ? errno : 0;
-        recordEvent(ev);
-        errno = ev.error;
-        return fd;
+        VmsgDeviceEvent ev{Kind::Open, fd, flags};
+        return record(ev, fd);
     }
 
     int ioctl(int fd, unsigned long request, void* arg) {
         if (request == VMSG_IOC_SEND_RECEIVE) return sendReceive(fd);
         std::lock_guard<std::mutex> lock(mMutex);
-        VmsgDeviceEvent ev;
-        ev.fd = fd;
-        ev.request = request;
+        VmsgDeviceEvent ev{Kind::OtherIoctl, fd, 0, request};
+        int result = -1;
         if (request == VMSG_IOC_CONNECT) {
-            ev.kind = VmsgDeviceEventKind::Connect;
-            ev.result = connect(fd, static_cast<uint8_t*>(arg), ev);
+            ev.kind = Kind::Connect;
+            result = connect(fd, static_cast<uint8_t*>(arg), ev);
         } else if (request == VMSG_IOC_DISCONNECT) {
-            ev.kind = VmsgDeviceEventKind::Disconnect;
-            ev.result = disconnect(fd);
+            ev.kind = Kind::Disconnect;
+            result = disconnect(fd);
         } else {
-            ev.kind = VmsgDeviceEventKind::OtherIoctl;
-            ev.result = fail(ENOTTY);
+            result = fail(ENOTTY);
         }
-        ev.error = ev.result < 0 ? errno : 0;
-        recordEvent(ev);
-        errno = ev.error;
-        return ev.result;
+        return record(ev, result);
     }
 
     int close(int fd, int (*realClose)(int)) {
         {  // acquire lock
             std::lock_guard<std::mutex> lock(mMutex);
             mConnections.erase(fd);
-            markDeviceFd(fd, false);
+            gDeviceFds[fd].store(false);
         }  // release lock: the descriptor is no longer ours when the number is reused
         const int result = realClose(fd);
+        VmsgDeviceEvent ev{Kind::Close, fd};
         const int err = errno;
-        VmsgDeviceEvent ev;
-        ev.kind = VmsgDeviceEventKind::Close;
-        ev.fd = fd;
-        ev.result = result;
-        ev.error = result < 0 ? err : 0;
-        {
-            std::lock_guard<std::mutex> lock(mMutex);
-            recordEvent(ev);
-        }
+        std::lock_guard<std::mutex> lock(mMutex);
         errno = err;
-        return result;
+        return record(ev, result);
     }
 
     void configure(const VmsgDeviceScript& script) {
@@ -222,63 +150,52 @@ class Device {
         mHook = nullptr;
     }
 
-    VmsgDeviceScript script() {
+    // A copy of one piece of state, taken under the lock.
+    template <typename T>
+    T copy(T Device::*field) {
         std::lock_guard<std::mutex> lock(mMutex);
-        return *mScript;
+        return this->*field;
     }
-    std::vector<VmsgDeviceExchange> exchanges() {
+    void setHook(std::function<void(uint32_t)> hook) {
         std::lock_guard<std::mutex> lock(mMutex);
-        return mExchanges;
-    }
-    std::vector<VmsgDeviceEvent> events() {
-        std::lock_guard<std::mutex> lock(mMutex);
-        return mEvents;
-    }
-    size_t overlaps() {
-        std::lock_guard<std::mutex> lock(mMutex);
-        return mOverlaps;
-    }
-    bool waitForExchanges(size_t count, uint32_t timeoutMs) {
-        std::unique_lock<std::mutex> lock(mMutex);
-        return mRecorded.wait_for(lock, std::chrono::milliseconds(timeoutMs),
-                                  [&] { return mExchanges.size() >= count; });
-    }
-    uint64_t served() {
-        std::lock_guard<std::mutex> lock(mMutex);
-        return mServed;
+        mHook = std::move(hook);
     }
     bool waitForServed(uint64_t count, uint32_t timeoutMs) {
         std::unique_lock<std::mutex> lock(mMutex);
         return mServedChanged.wait_for(lock, std::chrono::milliseconds(timeoutMs),
                                        [&] { return mServed >= count; });
     }
-    size_t openCount() {
-        std::lock_guard<std::mutex> lock(mMutex);
-        return mConnections.size();
-    }
-    void setHook(std::function<void(uint32_t)> hook) {
-        std::lock_guard<std::mutex> lock(mMutex);
-        mHook = std::move(hook);
-    }
+
+    std::shared_ptr<const VmsgDeviceScript> mScript;
+    std::map<int, Connection> mConnections;
+    std::vector<VmsgDeviceExchange> mExchanges;
+    std::vector<VmsgDeviceEvent> mEvents;
+    size_t mOverlaps = 0;
+    uint64_t mServed = 0;
+    std::function<void(uint32_t)> mHook;
+    std::condition_variable mServedChanged;
 
   private:
+    // Records a call with its result and errno; returns the result with errno
+    // as the call left it.
+    int record(VmsgDeviceEvent& ev, int result) {
+        const int err = errno;
+        ev.result = result;
+        ev.error = result < 0 ? err : 0;
+        if (mScript->record) mEvents.push_back(ev);
+        errno = err;
+        return result;
+    }
+
     int connect(int fd, uint8_t* arg, VmsgDeviceEvent& ev) {
         const auto it = mConnections.find(fd);
         if (it == mConnections.end()) return fail(EBADF);
         if (arg == nullptr) return fail(EFAULT);
         std::memcpy(ev.connectIn.data(), arg, ev.connectIn.size());
-        Connection& conn = it->second;
-        const VmsgDeviceScript& s = *mScript;
-        int result = 0;
-        if (conn.connected) {
-            result = fail(EISCONN);
-        } else if (le32(arg) != hcall::kServiceId) {
-            result = fail(ECONNREFUSED);
-        } else if (s.connectErrno != 0) {
-            result = fail(s.connectErrno);
-        } else {
-            result = establish(fd, conn, arg);
-        }
+        const int result = it->second.connected             ? fail(EISCONN)
+                           : le32(arg) != hcall::kServiceId ? fail(ECONNREFUSED)
+                           : mScript->connectErrno != 0     ? fail(mScript->connectErrno)
+                                                            : establish(fd, it->second, arg);
         std::memcpy(ev.connectOut.data(), arg, ev.connectOut.size());
         return result;
     }
@@ -286,29 +203,20 @@ class Device {
     int establish(int fd, Connection& conn, uint8_t* arg) {
         const VmsgDeviceScript& s = *mScript;
         const uint64_t page = uint64_t(sysconf(_SC_PAGESIZE));
+        const uint64_t afterHost = (s.hostBoundCapacity + page - 1) / page * page;
         const uint32_t offset =
-            s.guestBoundOffset != 0
-                ? s.guestBoundOffset
-                : uint32_t(std::min<uint64_t>((s.hostBoundCapacity + page - 1) / page * page,
-                                              0xFFFFFFFFu));
+            s.guestBoundOffset ? s.guestBoundOffset : uint32_t(std::min<uint64_t>(afterHost, ~0u));
         const uint64_t length = uint64_t(offset) + s.guestBoundCapacity;
         if (length != 0 && length <= kMaxBackedLayout) {
             if (ftruncate(fd, off_t(length)) != 0) return -1;
-            if (s.mmapFails) {
-                // No writable shared mapping of the memfd can be made after
-                // this seal, so the client's mmap fails in the kernel.
-                if (fcntl(fd, F_ADD_SEALS, F_SEAL_WRITE) != 0) return -1;
-            } else if (!backConnection(fd, conn, length, offset)) {
-                return -1;
-            }
+            // After this seal no writable shared mapping of the memfd can be
+            // made, so the client's mmap fails in the kernel.
+            if (s.mmapFails && fcntl(fd, F_ADD_SEALS, F_SEAL_WRITE) != 0) return -1;
+            if (!s.mmapFails && !backConnection(fd, conn, length, offset)) return -1;
         }
         conn.connected = true;
-        conn.hostBoundCapacity = s.hostBoundCapacity;
-        conn.guestBoundCapacity = s.guestBoundCapacity;
-        putLe32(arg + 4, s.hostBoundCapacity);
-        putLe32(arg + 8, s.guestBoundCapacity);
-        putLe32(arg + 12, s.spare);
-        putLe32(arg + 16, offset);
+        const uint32_t words[] = {s.hostBoundCapacity, s.guestBoundCapacity, s.spare, offset};
+        for (int i = 0; i < 4; ++i) hcall::putLe32(arg + 4 + 4 * i, words[i]);
         return 0;
     }
 
@@ -318,9 +226,9 @@ class Device {
         auto memory = std::make_shared<SharedMemory>();
         memory->view = static_cast<uint8_t*>(view);
         memory->length = length;
+        memory->limits = HcallLimits{mScript->hostBoundCapacity, mScript->guestBoundCapacity};
         memory->requestBytes = uint32_t(std::min<uint64_t>(mScript->hostBoundCapacity, length));
         memory->guestOffset = offset;
-        memory->replyBytes = mScript->guestBoundCapacity;
         memory->taken.resize(memory->requestBytes);
         conn.memory = std::move(memory);
         return true;
@@ -334,68 +242,51 @@ class Device {
         return 0;
     }
 
-    // Starts an exchange under the lock: everything it needs is copied or
-    // shared, so the host can serve it with the lock released.
+    // Starts an exchange under the lock, drawing its random fate.
     int begin(int fd, Exchange& x) {
         std::lock_guard<std::mutex> lock(mMutex);
         const auto it = mConnections.find(fd);
-        if (it == mConnections.end()) return fail(EBADF);
-        Connection& conn = it->second;
-        if (!conn.connected) return fail(ENOTCONN);
-        if (!conn.memory) return fail(EFAULT);
-        x.fd = fd;
-        x.script = mScript;
-        x.memory = conn.memory;
-        if (mHook) x.hook = mHook;
-        x.hostBoundCapacity = conn.hostBoundCapacity;
-        x.guestBoundCapacity = conn.guestBoundCapacity;
-        x.seq = mSeq++;
-        x.overlapped = ++conn.inFlight > 1;
+        const int result = it == mConnections.end() ? fail(EBADF)
+                           : !it->second.connected  ? fail(ENOTCONN)
+                           : !it->second.memory     ? fail(EFAULT)
+                                                    : 0;
+        if (result != 0) {
+            VmsgDeviceEvent ev{Kind::SendReceive, fd, 0, VMSG_IOC_SEND_RECEIVE};
+            return record(ev, result);
+        }
         const VmsgDeviceScript& s = *mScript;
-        if (s.delayJitterUs != 0) x.extraDelayUs = mRandom.upTo(s.delayJitterUs);
-        if (mRandom.perMille(s.sendFailurePerMille)) x.sendErrno = EIO;
-        x.failed = mRandom.perMille(s.failurePerMille);
+        x = Exchange{fd, mScript, it->second.memory, mHook, mSeq++, ++it->second.inFlight > 1};
+        // Each draw only when its share is set, so one setting does not move
+        // the others' sequence.
+        auto upTo = [this](uint32_t bound) { return mRandom() % (uint64_t(bound) + 1); };
+        x.delayUs = s.delayUs + (s.delayJitterUs ? uint32_t(upTo(s.delayJitterUs)) : 0);
+        x.sendErrno = s.sendFailurePerMille && upTo(999) < s.sendFailurePerMille ? EIO : 0;
+        if (s.sendErrno != 0) x.sendErrno = s.sendErrno;
+        x.failed = s.failurePerMille != 0 && upTo(999) < s.failurePerMille;
         return 0;
     }
 
+    // Takes the request, lets the scripted host answer it, records the exchange.
     int sendReceive(int fd) {
         Exchange x;
-        if (begin(fd, x) != 0) {
-            const int err = errno;
-            std::lock_guard<std::mutex> lock(mMutex);
-            VmsgDeviceEvent ev;
-            ev.kind = VmsgDeviceEventKind::SendReceive;
-            ev.fd = fd;
-            ev.request = VMSG_IOC_SEND_RECEIVE;
-            ev.result = -1;
-            ev.error = err;
-            recordEvent(ev);
-            return fail(err);
-        }
+        if (begin(fd, x) != 0) return -1;
         SharedMemory& m = *x.memory;
-        // An overlapping exchange must not share the snapshot buffer with
-        // the one it overlaps.
-        std::vector<uint8_t> ownCopy;
-        uint8_t* taken = m.taken.data();
-        if (x.overlapped) {
-            ownCopy.resize(m.requestBytes);
-            taken = ownCopy.data();
-        }
+        // An overlapping exchange must not share the snapshot with the one it
+        // overlaps.
+        std::vector<uint8_t> ownCopy(x.overlapped ? m.requestBytes : 0);
+        uint8_t* taken = x.overlapped ? ownCopy.data() : m.taken.data();
         const uint32_t total = m.requestBytes >= 8 ? le32(m.view + 4) : 0;
         x.requestLen = std::min(m.requestBytes, std::max<uint32_t>(total, 8));
         if (x.requestLen != 0) std::memcpy(taken, m.view, x.requestLen);
 
         bool rewritten = false;
-        if (x.script->sendErrno != 0) x.sendErrno = x.script->sendErrno;
         if (x.sendErrno == 0) {
-            const HcallDecoded d =
-                hcallCheck(taken, x.requestLen, x.hostBoundCapacity, x.guestBoundCapacity);
-            const uint32_t delayUs = x.script->delayUs + x.extraDelayUs;
-            if (delayUs != 0) usleep(delayUs);
-            if (x.hook) x.hook(d.opCode);
+            if (x.delayUs != 0) usleep(x.delayUs);
+            if (x.hook) x.hook(x.requestLen >= 4 ? le32(taken) : 0);
             rewritten = x.requestLen != 0 && std::memcmp(taken, m.view, x.requestLen) != 0;
             x.replyLen =
-                writeReply(*x.script, d, m.view + m.guestOffset, m.replyBytes, x.seq, x.failed);
+                writeReply(*x.script, taken, x.requestLen, m.limits, m.view + m.guestOffset,
+                           m.limits.guestBoundCapacity, x.seq, x.failed);
         }
         finish(x, taken, rewritten);
         return x.sendErrno != 0 ? fail(x.sendErrno) : 0;
@@ -406,84 +297,66 @@ class Device {
         const auto it = mConnections.find(x.fd);
         if (it != mConnections.end() && it->second.memory == x.memory) --it->second.inFlight;
         const bool overlapped = x.overlapped || rewritten;
-        if (overlapped) ++mOverlaps;
+        mOverlaps += overlapped;
         ++mServed;
         mServedChanged.notify_all();
         const VmsgDeviceScript& s = *x.script;
-        if (!s.record && mTraceFd < 0 && !s.printCalls && !overlapped) return;
+        if (!s.record && mTrace == nullptr && !s.printCalls && !overlapped) return;
 
         VmsgDeviceExchange e;
         e.request.assign(taken, taken + x.requestLen);
         const uint8_t* reply = x.memory->view + x.memory->guestOffset;
         if (x.sendErrno == 0) e.reply.assign(reply, reply + x.replyLen);
-        const HcallDecoded d =
-            hcallDecode(e.request.data(), e.request.size(), x.sendErrno ? nullptr : reply,
-                        x.replyLen, x.hostBoundCapacity, x.guestBoundCapacity);
-        e.opCode = d.opCode;
-        e.wellFormed = d.wellFormed;
-        e.problem = d.problem;
-        e.text = d.text;
-        if (x.sendErrno != 0) e.text += " -> !failed: errno " + std::to_string(x.sendErrno);
+        const HcallRequest r = hcallParseRequest(taken, x.requestLen, x.memory->limits);
+        e.opCode = r.opCode;
+        e.wellFormed = r.ok();
+        e.problem = hcallFaultText(r);
+        e.text = x.sendErrno != 0
+                     ? hcallCallText(r) + " -> !failed: errno " + std::to_string(x.sendErrno)
+                     : hcallExchangeText(r, e.reply.data(), e.reply.size());
         e.sendErrno = x.sendErrno;
         e.overlapped = overlapped;
         report(e, s);
-        if (s.record) {
-            mExchanges.push_back(std::move(e));
-            mRecorded.notify_all();
-        }
-        VmsgDeviceEvent ev;
-        ev.kind = VmsgDeviceEventKind::SendReceive;
-        ev.fd = x.fd;
-        ev.request = VMSG_IOC_SEND_RECEIVE;
-        ev.result = x.sendErrno ? -1 : 0;
-        ev.error = x.sendErrno;
-        recordEvent(ev);
+        if (s.record) mExchanges.push_back(std::move(e));
+        VmsgDeviceEvent ev{Kind::SendReceive, x.fd, 0, VMSG_IOC_SEND_RECEIVE};
+        errno = x.sendErrno;
+        record(ev, x.sendErrno ? -1 : 0);
     }
 
     void report(const VmsgDeviceExchange& e, const VmsgDeviceScript& s) {
         if (e.overlapped)
-            writeAll(STDERR_FILENO, "vmsg-device: overlapping exchange: " + e.text + "\n");
-        if (s.printCalls) writeAll(STDERR_FILENO, e.text + "\n");
-        if (mTraceFd >= 0) {
-            const std::string reply =
-                e.sendErrno ? std::string("-") : hcallHex(e.reply.data(), e.reply.size());
-            writeAll(mTraceFd, "req=" + hcallHex(e.request.data(), e.request.size()) + " reply=" +
-                                   reply + " " + e.text + (e.overlapped ? " !overlap" : "") + "\n");
-        }
-    }
-
-    void recordEvent(const VmsgDeviceEvent& ev) {
-        if (mScript->record) mEvents.push_back(ev);
+            std::fprintf(stderr, "vmsg-device: overlapping exchange: %s\n", e.text.c_str());
+        if (s.printCalls) std::fprintf(stderr, "%s\n", e.text.c_str());
+        if (mTrace == nullptr) return;
+        const std::string reply = e.sendErrno ? "-" : hcallHex(e.reply.data(), e.reply.size());
+        std::fprintf(mTrace, "req=%s reply=%s %s%s\n",
+                     hcallHex(e.request.data(), e.request.size()).c_str(), reply.c_str(),
+                     e.text.c_str(), e.overlapped ? " !overlap" : "");
+        std::fflush(mTrace);
     }
 
     void openTrace() {
-        if (mTraceFd >= 0) ::close(mTraceFd);
-        mTraceFd = -1;
+        if (mTrace != nullptr) std::fclose(mTrace);
         const std::string& path = mScript->tracePath;
-        if (path.empty()) return;
-        if (isDevicePath(path.c_str())) {
-            // Opening it here would come back to this device under its lock.
-            writeAll(STDERR_FILENO, "vmsg-device: the device cannot trace into itself\n");
-            return;
-        }
-        mTraceFd = ::open(path.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644);
-        if (mTraceFd < 0) writeAll(STDERR_FILENO, "vmsg-device: cannot open trace " + path + "\n");
+        // Opening the device itself would come back here under the lock.
+        mTrace =
+            path.empty() || isDevicePath(path.c_str()) ? nullptr : std::fopen(path.c_str(), "ae");
+        if (mTrace == nullptr && !path.empty())
+            std::fprintf(stderr, "vmsg-device: cannot trace into %s\n", path.c_str());
     }
 
     std::mutex mMutex;
-    std::condition_variable mRecorded;
-    std::condition_variable mServedChanged;
-    std::shared_ptr<const VmsgDeviceScript> mScript;
-    std::map<int, Connection> mConnections;
-    std::vector<VmsgDeviceExchange> mExchanges;
-    std::vector<VmsgDeviceEvent> mEvents;
-    size_t mOverlaps = 0;
-    uint64_t mServed = 0;
     uint64_t mSeq = 0;
-    Random mRandom;
-    std::function<void(uint32_t)> mHook;
-    int mTraceFd = -1;
+    std::mt19937_64 mRandom;  // its sequence is the same on every platform
+    FILE* mTrace = nullptr;
 };
+
+// Never destroyed: the client disconnects from static destructors that may
+// run after ours would have.
+Device& device() {
+    static Device* device = new Device;
+    return *device;
+}
 
 }  // namespace
 
@@ -491,37 +364,28 @@ bool isDevicePath(const char* path) {
     return path != nullptr && std::strcmp(path, VMSG_DEVICE_PATH) == 0;
 }
 
-bool isDeviceFd(int fd) {
-    if (fd < 0 || fd >= kMaxFd) return false;
-    return (gDeviceFds[fd / 64].load(std::memory_order_acquire) >> (fd % 64)) & 1;
-}
+bool isDeviceFd(int fd) { return fd >= 0 && fd < kMaxFd && gDeviceFds[fd].load(); }
 
-int openDevice(int flags) { return Device::get().open(flags); }
-
+int openDevice(int flags) { return device().open(flags); }
 int deviceIoctl(int fd, unsigned long request, void* arg) {
-    return Device::get().ioctl(fd, request, arg);
+    return device().ioctl(fd, request, arg);
 }
-
-int closeDevice(int fd, int (*realClose)(int)) { return Device::get().close(fd, realClose); }
+int closeDevice(int fd, int (*realClose)(int)) { return device().close(fd, realClose); }
 
 }  // namespace vmsgdev
 
-void vmsgDeviceConfigure(const VmsgDeviceScript& script) {
-    vmsgdev::Device::get().configure(script);
-}
-VmsgDeviceScript vmsgDeviceScript() { return vmsgdev::Device::get().script(); }
-void vmsgDeviceReset() { vmsgdev::Device::get().reset(); }
-std::vector<VmsgDeviceExchange> vmsgDeviceExchanges() { return vmsgdev::Device::get().exchanges(); }
-std::vector<VmsgDeviceEvent> vmsgDeviceEvents() { return vmsgdev::Device::get().events(); }
-size_t vmsgDeviceOverlapCount() { return vmsgdev::Device::get().overlaps(); }
-bool vmsgDeviceWaitForExchanges(size_t count, uint32_t timeoutMs) {
-    return vmsgdev::Device::get().waitForExchanges(count, timeoutMs);
-}
-size_t vmsgDeviceOpenCount() { return vmsgdev::Device::get().openCount(); }
-uint64_t vmsgDeviceServedCount() { return vmsgdev::Device::get().served(); }
-bool vmsgDeviceWaitForServed(uint64_t count, uint32_t timeoutMs) {
-    return vmsgdev::Device::get().waitForServed(count, timeoutMs);
-}
-void vmsgDeviceSetHostHook(std::function<void(uint32_t)> hook) {
-    vmsgdev::Device::get().setHook(std::move(hook));
-}
+using vmsgdev::Device;
+using vmsgdev::device;
+
+// clang-format off
+void vmsgDeviceConfigure(const VmsgDeviceScript& script) { device().configure(script); }
+VmsgDeviceScript vmsgDeviceScript() { return *device().copy(&Device::mScript); }
+void vmsgDeviceReset() { device().reset(); }
+std::vector<VmsgDeviceExchange> vmsgDeviceExchanges() { return device().copy(&Device::mExchanges); }
+std::vector<VmsgDeviceEvent> vmsgDeviceEvents() { return device().copy(&Device::mEvents); }
+size_t vmsgDeviceOverlapCount() { return device().copy(&Device::mOverlaps); }
+size_t vmsgDeviceOpenCount() { return device().copy(&Device::mConnections).size(); }
+uint64_t vmsgDeviceServedCount() { return device().copy(&Device::mServed); }
+bool vmsgDeviceWaitForServed(uint64_t count, uint32_t timeoutMs) { return device().waitForServed(count, timeoutMs); }
+void vmsgDeviceSetHostHook(std::function<void(uint32_t)> hook) { device().setHook(std::move(hook)); }
+// clang-format on

@@ -1,27 +1,28 @@
 // Seams between the model's parts: the libc interposers hand device calls to
-// the device, which reads its start-up script from the environment.
+// the device, whose script comes from the environment and whose scripted host
+// writes each reply.
 #pragma once
 
-#include <string>
-
 #include "VmsgDeviceModel.h"
+#include "hcall/host/HcallHost.h"
 
 namespace vmsgdev {
 
 bool isDevicePath(const char* path);
-// Lock-free, since every close() in the process asks it.
-bool isDeviceFd(int fd);
-
-// open() of the device path: a new memfd, or -1 with errno set.
+bool isDeviceFd(int fd);  // lock-free: every close() in the process asks
 int openDevice(int flags);
 int deviceIoctl(int fd, unsigned long request, void* arg);
 // Forgets the descriptor, then closes it with realClose and records the close.
 int closeDevice(int fd, int (*realClose)(int));
 
 // The script that VMSG_DEVICE_* variables describe; unset ones keep defaults.
-// Unreadable values are reported on standard error and ignored.
 VmsgDeviceScript scriptFromEnvironment();
-// Parses "12=-5,24=0"; false on a malformed list.
-bool parseResults(const std::string& text, std::map<uint32_t, int32_t>& results);
+
+// Writes the reply the script asks for into `out` (`capacity` bytes of
+// guest-bound buffer); returns how many bytes it wrote from the start. `seed`
+// varies the garbage; `failed` answers failureResult (the launch query: false).
+uint32_t writeReply(const VmsgDeviceScript& script, const uint8_t* request, uint32_t length,
+                    HcallLimits limits, uint8_t* out, uint32_t capacity, uint64_t seed,
+                    bool failed);
 
 }  // namespace vmsgdev

@@ -55,91 +55,48 @@ NextSymbol<OpenAt2Fn> nextOpenAt64_2("__openat64_2");
 NextSymbol<IoctlFn> nextIoctl("ioctl");
 NextSymbol<CloseFn> nextClose("close");
 
-bool needsMode(int flags) { return (flags & O_CREAT) != 0 || (flags & O_TMPFILE) == O_TMPFILE; }
-
-int missing() {
+// Calls the next definition with `args`, or fails with ENOSYS without one.
+template <typename Fn, typename... Args>
+int callNext(NextSymbol<Fn>& next, Args... args) {
+    Fn fn = next.get();
+    if (fn != nullptr) return fn(args...);
     errno = ENOSYS;
     return -1;
 }
 
 // The device path is absolute, so the directory descriptor of openat never
 // changes its meaning.
-int openAny(NextSymbol<OpenFn>& next, const char* path, int flags, mode_t mode) {
-    if (vmsgdev::isDevicePath(path)) return vmsgdev::openDevice(flags);
-    OpenFn fn = next.get();
-    return fn ? fn(path, flags, mode) : missing();
-}
-
-int openAtAny(NextSymbol<OpenAtFn>& next, int dirfd, const char* path, int flags, mode_t mode) {
-    if (vmsgdev::isDevicePath(path)) return vmsgdev::openDevice(flags);
-    OpenAtFn fn = next.get();
-    return fn ? fn(dirfd, path, flags, mode) : missing();
-}
-
-int open2Any(NextSymbol<Open2Fn>& next, const char* path, int flags) {
-    if (vmsgdev::isDevicePath(path)) return vmsgdev::openDevice(flags);
-    Open2Fn fn = next.get();
-    return fn ? fn(path, flags) : missing();
-}
-
-int openAt2Any(NextSymbol<OpenAt2Fn>& next, int dirfd, const char* path, int flags) {
-    if (vmsgdev::isDevicePath(path)) return vmsgdev::openDevice(flags);
-    OpenAt2Fn fn = next.get();
-    return fn ? fn(dirfd, path, flags) : missing();
-}
-
-int realClose(int fd) {
-    CloseFn fn = nextClose.get();
-    return fn ? fn(fd) : missing();
+template <typename Fn, typename... Args>
+int openVia(NextSymbol<Fn>& next, const char* path, int flags, Args... args) {
+    return vmsgdev::isDevicePath(path) ? vmsgdev::openDevice(flags) : callNext(next, args...);
 }
 
 }  // namespace
 
-// The optional mode argument is read only when the flags say it was passed.
-#define VMSG_MODE_ARG(flags, mode) \
-    mode_t mode = 0;               \
-    if (needsMode(flags)) {        \
-        va_list ap;                \
-        va_start(ap, flags);       \
-        mode = va_arg(ap, mode_t); \
-        va_end(ap);                \
+// The variants with an optional mode read it only when the flags say it was
+// passed.
+#define VMSG_OPEN(name, next, params, ...)                                \
+    VMSG_INTERPOSE int name params {                                      \
+        mode_t mode = 0;                                                  \
+        if ((flags & O_CREAT) != 0 || (flags & O_TMPFILE) == O_TMPFILE) { \
+            va_list ap;                                                   \
+            va_start(ap, flags);                                          \
+            mode = va_arg(ap, mode_t);                                    \
+            va_end(ap);                                                   \
+        }                                                                 \
+        return openVia(next, path, flags, __VA_ARGS__, mode);             \
     }
+VMSG_OPEN(open, nextOpen, (const char* path, int flags, ...), path, flags)
+VMSG_OPEN(open64, nextOpen64, (const char* path, int flags, ...), path, flags)
+VMSG_OPEN(openat, nextOpenAt, (int dirfd, const char* path, int flags, ...), dirfd, path, flags)
+VMSG_OPEN(openat64, nextOpenAt64, (int dirfd, const char* path, int flags, ...), dirfd, path, flags)
 
-VMSG_INTERPOSE int open(const char* path, int flags, ...) {
-    VMSG_MODE_ARG(flags, mode);
-    return openAny(nextOpen, path, flags, mode);
-}
-
-VMSG_INTERPOSE int open64(const char* path, int flags, ...) {
-    VMSG_MODE_ARG(flags, mode);
-    return openAny(nextOpen64, path, flags, mode);
-}
-
-VMSG_INTERPOSE int openat(int dirfd, const char* path, int flags, ...) {
-    VMSG_MODE_ARG(flags, mode);
-    return openAtAny(nextOpenAt, dirfd, path, flags, mode);
-}
-
-VMSG_INTERPOSE int openat64(int dirfd, const char* path, int flags, ...) {
-    VMSG_MODE_ARG(flags, mode);
-    return openAtAny(nextOpenAt64, dirfd, path, flags, mode);
-}
-
-VMSG_INTERPOSE int __open_2(const char* path, int flags) {
-    return open2Any(nextOpen2, path, flags);
-}
-
-VMSG_INTERPOSE int __open64_2(const char* path, int flags) {
-    return open2Any(nextOpen64_2, path, flags);
-}
-
-VMSG_INTERPOSE int __openat_2(int dirfd, const char* path, int flags) {
-    return openAt2Any(nextOpenAt2, dirfd, path, flags);
-}
-
-VMSG_INTERPOSE int __openat64_2(int dirfd, const char* path, int flags) {
-    return openAt2Any(nextOpenAt64_2, dirfd, path, flags);
-}
+// clang-format off
+VMSG_INTERPOSE int __open_2(const char* path, int flags) { return openVia(nextOpen2, path, flags, path, flags); }
+VMSG_INTERPOSE int __open64_2(const char* path, int flags) { return openVia(nextOpen64_2, path, flags, path, flags); }
+VMSG_INTERPOSE int __openat_2(int dirfd, const char* path, int flags) { return openVia(nextOpenAt2, path, flags, dirfd, path, flags); }
+VMSG_INTERPOSE int __openat64_2(int dirfd, const char* path, int flags) { return openVia(nextOpenAt64_2, path, flags, dirfd, path, flags); }
+// clang-format on
 
 // Every ioctl request takes at most one argument, passed on as a pointer-sized
 // word as the C library itself does.
@@ -149,11 +106,11 @@ VMSG_INTERPOSE int ioctl(int fd, unsigned long request, ...) noexcept {
     void* arg = va_arg(ap, void*);
     va_end(ap);
     if (vmsgdev::isDeviceFd(fd)) return vmsgdev::deviceIoctl(fd, request, arg);
-    IoctlFn fn = nextIoctl.get();
-    return fn ? fn(fd, request, arg) : missing();
+    return callNext(nextIoctl, fd, request, arg);
 }
 
 VMSG_INTERPOSE int close(int fd) {
-    if (vmsgdev::isDeviceFd(fd)) return vmsgdev::closeDevice(fd, realClose);
-    return realClose(fd);
+    if (vmsgdev::isDeviceFd(fd))
+        return vmsgdev::closeDevice(fd, [](int n) { return callNext(nextClose, n); });
+    return callNext(nextClose, fd);
 }

@@ -1,15 +1,10 @@
 // A stand-in for the paravirtual message device "/dev/kivvmsg" and the host
-// behind it, for the process it lives in.
-//
-// Linked into a test program (target vmsg_device_objects) or preloaded
-// (libvmsg_device.so), it interposes open/openat, ioctl and close: opening the
-// device path yields a memfd, so the client's mmap and munmap are the real
-// calls on real shared memory, and the three device requests on that
-// descriptor are served by an in-process host that speaks the host-call
-// service "hcal". Every other path and descriptor passes through untouched.
-//
-// Tests drive it through the functions below; a preloaded copy reads the same
-// settings from VMSG_DEVICE_* environment variables (see VmsgDeviceEnv.cpp).
+// behind it. Linked into a test program (vmsg_device_objects) or preloaded
+// (libvmsg_device.so), it interposes open/openat, ioctl and close: the device
+// path opens a memfd, so the client maps real shared memory, and the device's
+// requests are served by an in-process host built on hcall/host/HcallHost.h.
+// Every other path and descriptor passes through untouched. A preloaded copy
+// takes its script from the VMSG_DEVICE_* variables that README.md lists.
 // All functions are thread-safe.
 #pragma once
 
@@ -30,40 +25,32 @@ enum class VmsgDeviceReplyMode {
     Raw,       // exactly rawReply, whatever the operation
 };
 
-// What the device and the host answer. Settings that describe the connection
-// (capacities, offset, spare word, the mmap fault) take effect at the next
-// CONNECT; the others at the next request.
+// What the device and the host answer; README.md tells each setting's
+// environment variable. Settings of the connection take effect at the next
+// CONNECT, the others at the next request.
 struct VmsgDeviceScript {
-    // Out-words of CONNECT. guestBoundOffset 0 means "right after the
-    // host-bound buffer, rounded up to a page". The memfd is sized to
-    // guestBoundOffset + guestBoundCapacity, computed without wrapping. A
-    // layout beyond 256 MiB (a sum that wraps in 32 bits, say) is answered
-    // but not backed: SEND_RECEIVE on it fails with EFAULT.
+    // Out-words of CONNECT. guestBoundOffset 0 means "after the host-bound
+    // buffer, page-rounded". A layout beyond 256 MiB (a 32-bit sum that wraps,
+    // say) is answered but not backed: SEND_RECEIVE on it fails with EFAULT.
     uint32_t hostBoundCapacity = 65536;
     uint32_t guestBoundCapacity = 65536;
     uint32_t spare = 0;
     uint32_t guestBoundOffset = 0;
 
-    // Faults, each an errno value; 0 means no fault. The device refuses
-    // service ids other than "hcal" with ECONNREFUSED whatever is set here.
-    int openErrno = 0;     // open("/dev/kivvmsg") fails
-    int connectErrno = 0;  // VMSG_IOC_CONNECT fails
-    int sendErrno = 0;     // VMSG_IOC_SEND_RECEIVE fails (the request is still recorded)
-    // The memfd is sealed against writable shared mappings after CONNECT, so
-    // the client's mmap fails for real (EPERM).
-    bool mmapFails = false;
+    // Faults, each an errno value, 0 for none. Service ids other than "hcal"
+    // are always refused with ECONNREFUSED.
+    int openErrno = 0;
+    int connectErrno = 0;
+    int sendErrno = 0;       // the request is still recorded
+    bool mmapFails = false;  // the memfd is sealed, so the client's mmap fails (EPERM)
 
-    // Answers. results maps an operation code to its 4-byte result; codes not
-    // listed answer defaultResult. Operation 24 answers results[24] when it is
-    // listed, else launchAllowed as a bool field (1 or 0).
+    // Answers: results by operation code, else defaultResult (operation 24:
+    // launchAllowed). A malformed request gets -22 (XERR_INVAL).
     std::map<uint32_t, int32_t> results;
     int32_t defaultResult = 0;
     bool launchAllowed = true;
-    // A malformed request is answered with this result in the first 4 bytes.
-    int32_t malformedResult = -22;
 
-    // Filled data. Buffers get the bytes of the text, NUL-padded (or cut, and
-    // then unterminated) to the capacity the request named.
+    // Filled data; a text is NUL-padded, or cut to the buffer and unterminated.
     std::string propsText;   // operation 1, the char * buffer
     int32_t propsValue = 0;  // operation 1, the i32 *
     uint64_t timeValue = 0;  // operation 5, the u64 *
@@ -71,13 +58,8 @@ struct VmsgDeviceScript {
 
     // Pause inside SEND_RECEIVE before the reply is written.
     uint32_t delayUs = 0;
-
-    // A host that is slow and unreliable at random, reproducibly: every
-    // exchange draws from a generator seeded with randomSeed whenever a script
-    // is configured. It pauses a further 0 to delayJitterUs microseconds
-    // (uniformly); failurePerMille of the exchanges are answered with
-    // failureResult (a flag operation with false) instead of their result, and
-    // sendFailurePerMille of them fail SEND_RECEIVE itself with EIO.
+    // A host slow and unreliable at random, reproducibly: the generator is
+    // seeded with randomSeed whenever a script is configured.
     uint32_t delayJitterUs = 0;
     uint32_t failurePerMille = 0;
     int32_t failureResult = 5;  // XERR_IO
@@ -88,12 +70,9 @@ struct VmsgDeviceScript {
     uint32_t shortReplyBytes = 0;
     std::vector<uint8_t> rawReply;
 
-    // Each exchange is also appended, one line, to this file (empty: none) and,
-    // when printCalls is set, its decoded call is written to standard error.
-    std::string tracePath;
+    std::string tracePath;  // a line per exchange appended to this file
     bool printCalls = false;
-    // Keep exchanges and events for vmsgDeviceExchanges/Events. A benchmark
-    // turns it off: the host then allocates nothing on the exchange path.
+    // Keep exchanges and events. Off, the host allocates nothing per exchange.
     bool record = true;
 };
 
@@ -123,9 +102,7 @@ struct VmsgDeviceEvent {
     int error = 0;                         // errno when result is negative
 };
 
-// Replaces the script (and applies its trace and print settings).
 VMSG_DEVICE_API void vmsgDeviceConfigure(const VmsgDeviceScript& script);
-// The script in force.
 VMSG_DEVICE_API VmsgDeviceScript vmsgDeviceScript();
 // Default script, and forgets exchanges, events and overlaps. Open device
 // descriptors and their connections stay as they are.
@@ -136,21 +113,14 @@ VMSG_DEVICE_API std::vector<VmsgDeviceEvent> vmsgDeviceEvents();
 // Exchanges that began while another was in flight or whose request bytes
 // changed while the host was serving them. Tests expect 0.
 VMSG_DEVICE_API size_t vmsgDeviceOverlapCount();
-// Waits until at least `count` exchanges are recorded (since the last reset)
-// or timeoutMs passes; true when they are. For tests whose host calls run on
-// another thread. Needs record on.
-VMSG_DEVICE_API bool vmsgDeviceWaitForExchanges(size_t count, uint32_t timeoutMs);
 // Device descriptors currently open.
 VMSG_DEVICE_API size_t vmsgDeviceOpenCount();
-// SEND_RECEIVE requests that reached the host (served or failed) since the
-// last reset. Counted whether or not exchanges are recorded, so a long run
-// can pace itself on it without the model growing.
+// SEND_RECEIVE requests that reached the host since the last reset, recorded
+// or not, so that a long run can pace itself without the model growing.
 VMSG_DEVICE_API uint64_t vmsgDeviceServedCount();
-// Waits until the served count reaches `count` or timeoutMs passes; true when
-// it has.
 VMSG_DEVICE_API bool vmsgDeviceWaitForServed(uint64_t count, uint32_t timeoutMs);
 
-// Called inside every SEND_RECEIVE after the request was taken and before the
-// reply is written, outside the model's locks, with the operation code. Lets a
-// test hold an exchange in flight behind a gate. An empty function removes it.
+// Called in every SEND_RECEIVE between taking the request and replying,
+// outside the model's locks, with the operation code: a test can hold an
+// exchange in flight. An empty function removes it.
 VMSG_DEVICE_API void vmsgDeviceSetHostHook(std::function<void(uint32_t opCode)> hook);

@@ -1,103 +1,81 @@
-#include "VmsgDeviceReply.h"
-
+// The scripted host's reply, or the broken one the script asks for instead.
 #include <algorithm>
 #include <cstring>
+#include <random>
+#include <vector>
+
+#include "VmsgDeviceInternal.h"
 
 namespace vmsgdev {
 namespace {
 
-// Writes little-endian fields one after another, dropping whatever falls
-// past the limit: a short reply is the proper one cut off.
-class ReplyWriter {
+// The script as a host: a result per operation, the filled data of
+// operations 1 and 5.
+class ScriptedHost : public HcallHandler {
   public:
-    ReplyWriter(uint8_t* out, uint32_t limit) : mOut(out), mLimit(limit) {}
+    ScriptedHost(const VmsgDeviceScript& script, bool failed) : mScript(script), mFailed(failed) {}
 
-    void bytes(const void* data, size_t len) {
-        const size_t room = mPos < mLimit ? mLimit - mPos : 0;
-        if (room != 0 && len != 0) std::memcpy(mOut + mPos, data, std::min(len, room));
-        mPos += len;
+    int32_t unhandled(const hcall::OpInfo& op) override {
+        const bool flag = op.result == hcall::Flag;
+        if (mFailed) return flag ? 0 : mScript.failureResult;
+        const auto it = mScript.results.find(op.code);
+        if (it != mScript.results.end()) return it->second;
+        return flag ? int32_t(mScript.launchAllowed) : mScript.defaultResult;
     }
-    void zeros(size_t len) {
-        const size_t room = mPos < mLimit ? mLimit - mPos : 0;
-        if (room != 0) std::memset(mOut + mPos, 0, std::min(len, room));
-        mPos += len;
+    int32_t hcallGetPropsRpc(char* buffer, int32_t length, int32_t* value) override {
+        fill(buffer, length, mScript.propsText);
+        *value = mScript.propsValue;
+        return unhandled(hcall::kOps[hcall::kOp_hcallGetPropsRpc - 1]);
     }
-    void u32(uint32_t v) {
-        const uint8_t le[4] = {uint8_t(v), uint8_t(v >> 8), uint8_t(v >> 16), uint8_t(v >> 24)};
-        bytes(le, sizeof le);
+    int32_t hcallGetTimeInfoRpc(uint64_t* time, char* buffer, int32_t length) override {
+        *time = mScript.timeValue;
+        fill(buffer, length, mScript.timeText);
+        return unhandled(hcall::kOps[hcall::kOp_hcallGetTimeInfoRpc - 1]);
     }
-    void u64(uint64_t v) {
-        u32(uint32_t(v));
-        u32(uint32_t(v >> 32));
-    }
-    // A buffer gets the text, then NUL padding; a text as long as the buffer
-    // or longer is cut and arrives unterminated.
-    void text(const std::string& s, uint32_t capacity) {
-        const size_t n = std::min<size_t>(s.size(), capacity);
-        bytes(s.data(), n);
-        zeros(capacity - n);
-    }
-    uint32_t written() const { return uint32_t(std::min<size_t>(mPos, mLimit)); }
 
   private:
-    uint8_t* mOut;
-    size_t mLimit;
-    size_t mPos = 0;
+    // A text as long as the buffer or longer arrives cut and unterminated.
+    static void fill(char* buffer, int32_t length, const std::string& text) {
+        std::memcpy(buffer, text.data(), std::min<size_t>(text.size(), size_t(length)));
+    }
+
+    const VmsgDeviceScript& mScript;
+    bool mFailed;
 };
 
-int32_t resultFor(const VmsgDeviceScript& s, const hcall::OpInfo& op, bool failed) {
-    if (failed) return op.result == hcall::Flag ? 0 : s.failureResult;
-    const auto it = s.results.find(op.code);
-    if (it != s.results.end()) return it->second;
-    if (op.result == hcall::Flag) return s.launchAllowed ? 1 : 0;
-    return s.defaultResult;
-}
-
-void writeScripted(const VmsgDeviceScript& s, const HcallDecoded& d, bool failed, ReplyWriter& w) {
-    if (!d.wellFormed) {
-        w.u32(uint32_t(s.malformedResult));
-        return;
-    }
-    for (int i = 0; i < d.numFilled; ++i) {
-        const HcallFilled& f = d.filled[i];
-        if (f.kind == hcall::OutI32) w.u32(uint32_t(s.propsValue));
-        if (f.kind == hcall::OutU64) w.u64(s.timeValue);
-        if (f.kind == hcall::Buf) w.text(d.opCode == 1 ? s.propsText : s.timeText, f.size);
-    }
-    w.u32(uint32_t(resultFor(s, *d.op, failed)));
-}
-
 uint32_t writeGarbage(uint8_t* out, uint32_t capacity, uint64_t seed) {
-    uint64_t x = seed * 0x9E3779B97F4A7C15ULL + 0x2545F4914F6CDD1DULL;
-    for (uint32_t i = 0; i < capacity; ++i) {
-        x ^= x << 13;
-        x ^= x >> 7;
-        x ^= x << 17;
-        out[i] = uint8_t(x >> 32);
-    }
+    std::mt19937_64 noise(seed);
+    for (uint32_t i = 0; i < capacity; ++i) out[i] = uint8_t(noise() >> 56);
     return capacity;
 }
 
 }  // namespace
 
-uint32_t writeReply(const VmsgDeviceScript& script, const HcallDecoded& request, uint8_t* out,
-                    uint32_t capacity, uint64_t seed, bool failed) {
+uint32_t writeReply(const VmsgDeviceScript& script, const uint8_t* request, uint32_t length,
+                    HcallLimits limits, uint8_t* out, uint32_t capacity, uint64_t seed,
+                    bool failed) {
+    ScriptedHost host(script, failed);
     switch (script.replyMode) {
         case VmsgDeviceReplyMode::Garbage:
             return writeGarbage(out, capacity, seed);
         case VmsgDeviceReplyMode::Raw: {
-            ReplyWriter w(out, capacity);
-            w.bytes(script.rawReply.data(), script.rawReply.size());
-            return w.written();
+            const size_t n = std::min<size_t>(script.rawReply.size(), capacity);
+            if (n != 0) std::memcpy(out, script.rawReply.data(), n);
+            return uint32_t(n);
         }
-        case VmsgDeviceReplyMode::Short:
+        case VmsgDeviceReplyMode::Short: {
+            // The proper reply cut off: what lies past the cut stays as it was.
+            std::vector<uint8_t> full(capacity);
+            const size_t n = std::min<size_t>(
+                hcallDispatch(host, request, length, full.data(), capacity, limits),
+                script.shortReplyBytes);
+            if (n != 0) std::memcpy(out, full.data(), n);
+            return uint32_t(n);
+        }
         case VmsgDeviceReplyMode::Scripted:
             break;
     }
-    const bool cut = script.replyMode == VmsgDeviceReplyMode::Short;
-    ReplyWriter w(out, cut ? std::min(capacity, script.shortReplyBytes) : capacity);
-    writeScripted(script, request, failed, w);
-    return w.written();
+    return uint32_t(hcallDispatch(host, request, length, out, capacity, limits));
 }
 
 }  // namespace vmsgdev

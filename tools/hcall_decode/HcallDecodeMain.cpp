@@ -17,7 +17,7 @@
 #include <string>
 #include <vector>
 
-#include "HcallDecoder.h"
+#include "hcall/host/HcallHost.h"
 
 namespace {
 
@@ -72,11 +72,11 @@ bool parseArgs(int argc, char** argv, Options& o) {
 // Decodes one request (and reply, when given) and prints its line.
 bool decodeOne(const Options& o, const std::vector<uint8_t>& request,
                const std::vector<uint8_t>* reply) {
-    const HcallDecoded d =
-        hcallDecode(request.data(), request.size(), reply ? reply->data() : nullptr,
-                    reply ? reply->size() : 0, o.hostBoundCapacity, o.guestBoundCapacity);
-    std::cout << d.text << '\n';
-    return d.wellFormed;
+    const HcallRequest r = hcallParseRequest(request.data(), request.size(),
+                                             {o.hostBoundCapacity, o.guestBoundCapacity});
+    std::cout << (reply ? hcallExchangeText(r, reply->data(), reply->size()) : hcallCallText(r))
+              << '\n';
+    return r.ok();
 }
 
 // The value of a "key=" token in a trace line, or empty.

@@ -1,0 +1,164 @@
+// Both halves against requests and replies written by hand from the wire
+// rules (tests/data/hcall_golden.txt): the guest's exported operations must
+// send exactly those bytes and hand back what the reply holds; the host must
+// read the same values from them and build exactly that reply.
+
+#include <gtest/gtest.h>
+
+#include <fstream>
+#include <memory>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "DeviceSession.h"
+#include "LogRecorder.h"
+#include "hcall/host/HcallHost.h"
+#include "support/HcallInvoke.h"
+
+namespace {
+
+struct Row {
+    int line = 0;
+    std::vector<uint8_t> request;
+    std::vector<uint8_t> reply;
+    std::string exchange;  // how the two read
+};
+
+std::string trim(const std::string& s) {
+    const size_t first = s.find_first_not_of(' ');
+    return first == std::string::npos ? "" : s.substr(first, s.find_last_not_of(' ') - first + 1);
+}
+
+std::vector<Row> readCorpus() {
+    std::vector<Row> rows;
+    std::ifstream in(HCALL_GOLDEN);
+    std::string text;
+    for (int line = 1; std::getline(in, text); ++line) {
+        if (trim(text).empty() || text[0] == '#') continue;
+        const size_t bar1 = text.find(" | ");
+        const size_t bar2 = text.find(" | ", bar1 + 3);
+        Row row;
+        row.line = line;
+        row.exchange = text.substr(bar2 + 3);
+        const bool hex = bar2 != std::string::npos &&
+                         hcallParseHex(trim(text.substr(0, bar1)), row.request) &&
+                         hcallParseHex(trim(text.substr(bar1 + 3, bar2 - bar1 - 3)), row.reply);
+        EXPECT_TRUE(hex) << "line " << line << " is not request | reply | exchange";
+        rows.push_back(std::move(row));
+    }
+    return rows;
+}
+
+// Answers every operation with a row's own values.
+class RowHost : public HcallHandler {
+  public:
+    RowHost(const HcallRequest& answer, int32_t result) : mAnswer(answer), mResult(result) {}
+    int32_t unhandled(const hcall::OpInfo& op) override {
+        entered = op.code;
+        return mResult;
+    }
+    int32_t hcallGetPropsRpc(char* buffer, int32_t length, int32_t* value) override {
+        entered = hcall::kOp_hcallGetPropsRpc;
+        std::copy_n(mAnswer.params[0].text.data(), length, buffer);
+        *value = mAnswer.params[2].i32;
+        return mResult;
+    }
+    int32_t hcallGetTimeInfoRpc(uint64_t* time, char* buffer, int32_t length) override {
+        entered = hcall::kOp_hcallGetTimeInfoRpc;
+        *time = mAnswer.params[0].u64;
+        std::copy_n(mAnswer.params[1].text.data(), length, buffer);
+        return mResult;
+    }
+    uint32_t entered = 0;
+
+  private:
+    const HcallRequest& mAnswer;
+    int32_t mResult;
+};
+
+// The guest's storage for a call whose arguments are the values the host
+// read: strings point into the request (each ends in its NUL there), filled
+// buffers start empty.
+struct GuestCall {
+    HcallRequest& values;
+    std::unique_ptr<char[]> buffers[hcall::kMaxParams];
+
+    template <hcall::Kind K>
+    auto get(size_t i) {
+        HcallValue& v = values.params[i];
+        if constexpr (K == hcall::Str) {
+            return v.text.data();
+        } else if constexpr (K == hcall::I32) {
+            return v.i32;
+        } else if constexpr (K == hcall::Bool) {
+            return v.flag;
+        } else if constexpr (K == hcall::Buf) {
+            buffers[i].reset(new char[v.size + 1]());
+            v.text = {buffers[i].get(), v.size};
+            return buffers[i].get();
+        } else if constexpr (K == hcall::OutI32) {
+            return &v.i32;
+        } else {
+            return &v.u64;
+        }
+    }
+};
+
+class HcallGolden : public ::testing::Test {
+  protected:
+    LogRecorder log{XLOG_LEVEL_E};  // the call's own lines are checked elsewhere
+};
+
+TEST_F(HcallGolden, Host_ReadsEveryRowAndBuildsItsReply) {
+    const std::vector<Row> rows = readCorpus();
+    bool seen[hcall::kNumOps + 1] = {};
+    for (const Row& row : rows) {
+        SCOPED_TRACE("hcall_golden.txt:" + std::to_string(row.line) + " " + row.exchange);
+        HcallRequest request = hcallParseRequest(row.request.data(), row.request.size());
+        ASSERT_TRUE(request.ok()) << hcallFaultText(request);
+        seen[request.opCode] = true;
+        EXPECT_EQ(hcallExchangeText(request, row.reply.data(), row.reply.size()), row.exchange);
+
+        int32_t result = 0;
+        ASSERT_TRUE(hcallReadReply(request, row.reply.data(), row.reply.size(), result));
+        std::vector<uint8_t> built(row.reply.size() + 8, 0xEE);
+        EXPECT_EQ(hcallBuildReply(request, result, built.data(), built.size()), row.reply.size());
+        built.resize(row.reply.size());
+        EXPECT_EQ(built, row.reply) << "built from the values the host read";
+
+        RowHost host(request, result);
+        std::vector<uint8_t> dispatched(row.reply.size(), 0xEE);
+        EXPECT_EQ(hcallDispatch(host, row.request.data(), row.request.size(), dispatched.data(),
+                                dispatched.size()),
+                  row.reply.size());
+        EXPECT_EQ(dispatched, row.reply) << "the dispatcher's reply";
+        EXPECT_EQ(host.entered, request.opCode) << "the operation's own entry answered";
+    }
+    for (uint32_t code = 1; code <= hcall::kNumOps; ++code)
+        EXPECT_TRUE(seen[code]) << "no row for operation " << code;
+}
+
+TEST_F(HcallGolden, Guest_SendsEveryRowAndReadsItsReply) {
+    for (const Row& row : readCorpus()) {
+        SCOPED_TRACE("hcall_golden.txt:" + std::to_string(row.line) + " " + row.exchange);
+        VmsgDeviceScript script;
+        script.replyMode = VmsgDeviceReplyMode::Raw;
+        script.rawReply = row.reply;
+        HcallSession session(script);
+        ASSERT_TRUE(session.connected());
+        HcallRequest values = hcallParseRequest(row.request.data(), row.request.size());
+        ASSERT_TRUE(values.ok()) << hcallFaultText(values);
+
+        GuestCall guest{values, {}};
+        const int32_t result = int32_t(hcalltest::invokeExported(values.opCode, guest));
+
+        EXPECT_EQ(onlyExchange().request, row.request) << "the bytes the guest sent";
+        std::vector<uint8_t> received(row.reply.size());
+        ASSERT_EQ(hcallBuildReply(values, result, received.data(), received.size()),
+                  row.reply.size());
+        EXPECT_EQ(received, row.reply) << "what the guest handed back: filled data and result";
+    }
+}
+
+}  // namespace

@@ -1,0 +1,182 @@
+// The host half beyond the golden corpus (tests/hcall/HcallGolden_test.cpp):
+// requests it must refuse and why, replies no proper host builds, and what
+// the dispatcher hands a handler.
+
+#include "hcall/host/HcallHost.h"
+
+#include <gtest/gtest.h>
+
+#include <string>
+#include <vector>
+
+namespace {
+
+std::vector<uint8_t> hex(const std::string& text) {
+    std::vector<uint8_t> bytes;
+    EXPECT_TRUE(hcallParseHex(text, bytes)) << "not hex: " << text;
+    return bytes;
+}
+
+HcallRequest parse(const std::vector<uint8_t>& bytes, HcallLimits limits = {}) {
+    return hcallParseRequest(bytes.data(), bytes.size(), limits);
+}
+
+TEST(HcallHostParse, Request_BreakingARule_IsRefusedWithItsReason) {
+    const struct {
+        const char* request;
+        HcallLimits limits;
+        const char* problem;
+    } rows[] = {
+        {"0C000000 1000", {}, "request of 6 bytes is shorter than the header"},
+        {"00000000 08000000", {}, "unknown operation code 0"},
+        {"2C000000 08000000", {}, "unknown operation code 44"},
+        {"10000000 04000000", {}, "totalLength 4 is shorter than the header"},
+        {"07000000 0C000000 01000000", {8, 0}, "totalLength 12 exceeds the host-bound capacity 8"},
+        {"07000000 0C000000", {}, "totalLength 12 runs past the 8 bytes received"},
+        {"07000000 08000000", {}, "parameter at offset 8 runs past totalLength 8"},
+        {"0C000000 10000000 00000000 61626300",
+         {},
+         "string count 0 at offset 8 leaves no room for the NUL"},
+        {"0C000000 10000000 09000000 61626300",
+         {},
+         "string count 9 at offset 8 runs past totalLength 16"},
+        {"0C000000 10000000 04000000 61626364", {}, "string at offset 8 lacks its terminating NUL"},
+        {"0C000000 10000000 04000000 61006300",
+         {},
+         "string at offset 8 holds a NUL before its end"},
+        {"09000000 0C000000 02000000", {}, "bool field at offset 8 holds 0x00000002"},
+        {"09000000 0C000000 00010000", {}, "bool field at offset 8 holds 0x00000100"},
+        {"01000000 14000000 08000000 08000000 08000000",
+         {},
+         "i32* size field at offset 16 is 8, not 4"},
+        {"05000000 14000000 04000000 08000000 08000000",
+         {},
+         "u64* size field at offset 8 is 4, not 8"},
+        {"10000000 0C000000 00000000", {}, "totalLength 12 but the fields end at 8"},
+        {"01000000 14000000 FFFFFFFF FFFFFFFF 04000000", {}, "buffer length -1 is negative"},
+        {"01000000 14000000 08000000 10000000 04000000",
+         {},
+         "buffer capacity 8 differs from its length parameter 16"},
+        {"01000000 14000000 08000000 08000000 04000000",
+         {0, 15},
+         "reply of 16 bytes exceeds the guest-bound capacity 15"},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.request);
+        const HcallRequest r = parse(hex(row.request), row.limits);
+        EXPECT_FALSE(r.ok());
+        EXPECT_EQ(hcallFaultText(r), row.problem);
+        EXPECT_EQ(hcallCallText(r).rfind("!malformed ", 0), 0u) << "refusals are marked";
+    }
+    EXPECT_TRUE(parse(hex("01000000 14000000 08000000 08000000 04000000"), {20, 16}).ok())
+        << "a request and its reply exactly at the capacities fit";
+    EXPECT_EQ(hcallCallText(parse(hex("2C000000 08000000"))),
+              "!malformed op 44: unknown operation code 44");
+}
+
+TEST(HcallHostText, Reply_ShortOrWithStrayBytes_ReadsAsTheGuestReadsIt) {
+    const char* props = "01000000 14000000 08000000 08000000 04000000";
+    const char* launch = "18000000 0E000000 02000000 7000";
+    const struct {
+        const char* request;
+        const char* reply;
+        const char* text;
+    } rows[] = {
+        {props, "61626300 00000000",
+         "hcallGetPropsRpc(char[8]=\"abc\", 8, i32*) -> !short reply: 8 of 16 bytes"},
+        {props, "61626300", "hcallGetPropsRpc(char[8], 8, i32*) -> !short reply: 4 of 16 bytes"},
+        {launch, "00FFFFFF", "hcallIsAppLaunchAllowedRpc(\"p\") -> false"},
+        {launch, "02000000", "hcallIsAppLaunchAllowedRpc(\"p\") -> true"},
+    };
+    for (const auto& row : rows) {
+        const std::vector<uint8_t> reply = hex(row.reply);
+        EXPECT_EQ(hcallExchangeText(parse(hex(row.request)), reply.data(), reply.size()), row.text);
+    }
+}
+
+TEST(HcallHostReply, Build_CutsOrPadsTheBufferAndNeedsRoomForAll) {
+    HcallRequest r = parse(hex("01000000 14000000 04000000 04000000 04000000"));
+    ASSERT_TRUE(r.ok());
+    std::vector<uint8_t> out(12, 0xEE);
+    r.params[0].text = "0123456789";
+    ASSERT_EQ(hcallBuildReply(r, -1, out.data(), out.size()), 12u);
+    EXPECT_EQ(out, hex("30313233 00000000 FFFFFFFF")) << "a long text is cut to the capacity";
+    r.params[0].text = "a";
+    r.params[2].i32 = 9;
+    ASSERT_EQ(hcallBuildReply(r, 0, out.data(), out.size()), 12u);
+    EXPECT_EQ(out, hex("61000000 09000000 00000000")) << "a short text is NUL-padded";
+    EXPECT_EQ(hcallBuildReply(r, 0, out.data(), 11), 0u) << "11 bytes cannot hold the reply";
+}
+
+// Records what each overridden entry receives.
+class RecordingHost : public HcallHandler {
+  public:
+    int32_t hcallOnAppInstalledRpc(std::string_view package, std::string_view activity,
+                                   std::string_view label, int32_t versionCode,
+                                   std::string_view versionName, std::string_view icon,
+                                   std::string_view source, bool isUpdate) override {
+        seen = std::string(package) + "|" + std::string(activity) + "|" + std::string(label) + "|" +
+               std::to_string(versionCode) + "|" + std::string(versionName) + "|" +
+               std::string(icon) + "|" + std::string(source) + "|" + (isUpdate ? "1" : "0");
+        return 11;
+    }
+    int32_t hcallOnVibrateRpc(int32_t duration, std::string_view pkg) override {
+        seen = std::to_string(duration) + "|" + std::string(pkg);
+        return 12;
+    }
+    bool hcallIsAppLaunchAllowedRpc(std::string_view pkg) override { return pkg == "yes"; }
+    int32_t malformed(const HcallRequest& request) override {
+        seen = hcallFaultText(request);
+        return 99;
+    }
+    std::string seen;
+};
+
+TEST(HcallHostDispatch, Request_ReachesItsEntryWithItsValues) {
+    const struct {
+        const char* request;
+        const char* reply;
+        const char* seen;
+    } rows[] = {
+        {"0D000000 34000000 02000000 7000 03000000 616300 02000000 6C00 F9FFFFFF 01000000 00 "
+         "02000000 6900 02000000 7300 00000000",
+         "0B000000", "p|ac|l|-7||i|s|0"},
+        {"0D000000 34000000 02000000 7000 03000000 616300 02000000 6C00 F9FFFFFF 01000000 00 "
+         "02000000 6900 02000000 7300 01000000",
+         "0B000000", "p|ac|l|-7||i|s|1"},
+        {"1E000000 12000000 9CFFFFFF 02000000 6100", "0C000000", "-100|a"},
+        {"18000000 10000000 04000000 79657300", "01000000", ""},
+        {"18000000 0F000000 03000000 6E6F00", "00000000", ""},
+        {"07000000 0C000000 05000000", "00000000", ""},
+        {"09000000 0C000000 02000000", "63000000", "bool field at offset 8 holds 0x00000002"},
+        {"01000000 14000000 08000000 08000000 04000000", "63000000",
+         "reply of 16 bytes exceeds the guest-bound capacity 12"},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.request);
+        RecordingHost host;
+        const std::vector<uint8_t> request = hex(row.request);
+        std::vector<uint8_t> reply(12, 0xEE);
+        const size_t n = hcallDispatch(host, request.data(), request.size(), reply.data(), 12);
+        reply.resize(n);
+        EXPECT_EQ(reply, hex(row.reply));
+        EXPECT_EQ(host.seen, row.seen);
+    }
+    RecordingHost host;
+    const std::vector<uint8_t> request = hex("07000000 0C000000 05000000");
+    uint8_t reply[3] = {};
+    EXPECT_EQ(hcallDispatch(host, request.data(), request.size(), reply, sizeof reply), 0u)
+        << "no answer fits fewer than 4 bytes";
+}
+
+TEST(HcallHostText, ParseHex_TakesBlanksBetweenBytesOnly) {
+    std::vector<uint8_t> bytes;
+    EXPECT_TRUE(hcallParseHex("0a0B 0c,\t0D", bytes));
+    EXPECT_EQ(bytes, (std::vector<uint8_t>{0x0A, 0x0B, 0x0C, 0x0D}));
+    EXPECT_FALSE(hcallParseHex("0a 0", bytes)) << "odd digit count";
+    EXPECT_FALSE(hcallParseHex("0 a", bytes)) << "blank inside a byte";
+    EXPECT_FALSE(hcallParseHex("0g", bytes));
+    EXPECT_EQ(hcallHex(reinterpret_cast<const uint8_t*>("\x01\xAB"), 2), "01ab");
+}
+
+}  // namespace
