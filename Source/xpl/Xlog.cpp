@@ -7,6 +7,7 @@
 #include <new>
 
 #include "xpl/XlogInternal.h"
+#include "xpl/XplLoadOrder.h"
 
 namespace {
 
@@ -34,6 +35,7 @@ XlogState* createState() {
     auto* state = new XlogState();
     state->logger.shouldLog = xlogShouldLog;
     state->logger.print = xlogPrint;
+    g_xlog = state;
     return state;
 }
 
@@ -51,8 +53,12 @@ XlogState* xlogState() {
     return state;
 }
 
-// Forced at load as well, so that g_xlog points at the record from then on.
-XlogState* g_xlog = xlogState();
+// Points at the record from its creation, which happens at its rank in the
+// load order or at an earlier first use.
+XlogState* g_xlog = nullptr;
+namespace {
+const XplLoadStep kCreateLogger XPL_LOAD_ORDER(XPL_LOAD_ORDER_XLOG)([] { xlogState(); });
+}  // namespace
 
 XlogLogger* xlogGetLogger() { return &xlogState()->logger; }
 
