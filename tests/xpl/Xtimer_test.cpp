@@ -13,7 +13,7 @@
 #include <string>
 #include <vector>
 
-#include "threading/Gate.h"
+#include "support/Gate.h"
 #include "xpl/Xtime.h"
 
 namespace {

@@ -22,7 +22,7 @@
 #include <string>
 #include <thread>
 
-#include "threading/Gate.h"
+#include "support/Gate.h"
 #include "xpl/XthrPool.h"
 #include "xpl/Xtimer.h"
 

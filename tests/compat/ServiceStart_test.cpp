@@ -1,0 +1,70 @@
+// The service start as native_init runs it, outside a JVM: a step that
+// succeeded is not run again, and calls from several threads at once take
+// turns. Each scenario runs in a child process of its own, since the start is
+// process-wide.
+
+#include "ServiceStart.h"
+
+#include <gtest/gtest.h>
+
+#include <mutex>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "VmsgDeviceModel.h"
+#include "support/ChildProcess.h"
+#include "support/Gate.h"
+#include "xpl/Xlog.h"
+#include "xpl/XthrPool.h"
+
+namespace {
+
+size_t countEvents(VmsgDeviceEventKind kind) {
+    size_t n = 0;
+    for (const VmsgDeviceEvent& event : vmsgDeviceEvents()) n += event.kind == kind;
+    return n;
+}
+
+int workers() {
+    std::lock_guard<std::mutex> lock(g_thr_pool.mutex);
+    return g_thr_pool.numActive;
+}
+
+// Regression guard: running the support library's start again would reset
+// the levels to "*:I XMEM:D".
+TEST(ServiceStart, Start_AfterAFailedConnect_KeepsLevelsSetSinceAndConnects) {
+    ChildOutcome child = runInChild([]() -> std::string {
+        VmsgDeviceScript script;
+        script.openErrno = ENOENT;
+        vmsgDeviceConfigure(script);
+        bridge::startService();
+        if (xlogSetLevels("HCALL:V") != XERR_SUCCESS) return "levels refused";
+        vmsgDeviceConfigure(VmsgDeviceScript());
+        bridge::startService();
+        if (!xlogShouldLog(XLOG_MODULE_HCALL, XLOG_LEVEL_V)) return "the levels were reset";
+        if (countEvents(VmsgDeviceEventKind::Connect) != 1) return "no connection on the retry";
+        return workers() == 1 ? "" : "no worker after the retry";
+    });
+    EXPECT_TRUE(child.ok()) << child.message;
+}
+
+TEST(ServiceStart, Start_FromSeveralThreadsAtOnce_ConnectsOnceAndStartsOneWorker) {
+    ChildOutcome child = runInChild([]() -> std::string {
+        Gate go;
+        std::vector<std::thread> callers;
+        for (int i = 0; i < 8; ++i) {
+            callers.emplace_back([&go] {
+                go.wait();
+                bridge::startService();
+            });
+        }
+        go.open();
+        for (std::thread& caller : callers) caller.join();
+        if (countEvents(VmsgDeviceEventKind::Open) != 1) return "the device was opened again";
+        return workers() == 1 ? "" : std::to_string(workers()) + " workers";
+    });
+    EXPECT_TRUE(child.ok()) << child.message;
+}
+
+}  // namespace
