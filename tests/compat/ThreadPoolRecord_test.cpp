@@ -112,16 +112,6 @@ TEST(ThreadPoolRecord, Init_WhenCountZeroOrNegative_StartsNoWorkerAndKeepsTasksQ
     }
 }
 
-TEST(ThreadPoolRecord, Init_AfterTasksWereAdded_RunsThem) {
-    onStackAndHeap([](ThreadPool& pool) {
-        EventLog events;
-        xthrPoolAddTask(&pool, [&] { events.record("early"); });
-        ASSERT_EQ(xthrPoolInit(&pool, 1), XERR_SUCCESS);
-        xthrPoolFini(&pool);
-        EXPECT_THAT(events.events(), ElementsAre("early"));
-    });
-}
-
 TEST(ThreadPoolRecord, Fini_WhenTasksQueued_DrainsQueueBeforeReturning) {
     onStackAndHeap([](ThreadPool& pool) {
         Gate firstStarted;
@@ -230,9 +220,8 @@ void printToStderr(int level, int module, const char* file, const char*, int lin
                  message);
 }
 
-void addAfterFini(bool onHeap) {
-    static ThreadPool stackLike{};
-    g_fatalPool = onHeap ? new ThreadPool() : &stackLike;
+void addAfterFini() {
+    g_fatalPool = new ThreadPool();
     static const XlogLogger logger = {logEverything, printToStderr};
     xlogLibInit(&logger, "", "*:I");
     xthrPoolInit(g_fatalPool, 1);
@@ -248,11 +237,9 @@ bool endedByDebugBreak(int status) {
 
 TEST(ThreadPoolRecordDeathTest, AddTask_AfterFini_PrintsFatalLineWithoutLockAndEndsProcess) {
     GTEST_FLAG_SET(death_test_style, "threadsafe");
-    for (bool onHeap : {false, true}) {
-        EXPECT_EXIT(addAfterFini(onHeap), endedByDebugBreak,
-                    "level=0 module=43 file=Source/xpl/XthrPool lock=free line=same "
-                    "msg=FATAL: DEBUG BREAK: Source/xpl/XthrPool:[0-9]+ xthrPoolAddTask\\(\\)\\|");
-    }
+    EXPECT_EXIT(addAfterFini(), endedByDebugBreak,
+                "level=0 module=43 file=Source/xpl/XthrPool lock=free line=same "
+                "msg=FATAL: DEBUG BREAK: Source/xpl/XthrPool:[0-9]+ xthrPoolAddTask\\(\\)\\|");
 }
 
 }  // namespace

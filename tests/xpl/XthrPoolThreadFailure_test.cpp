@@ -63,19 +63,4 @@ TEST(XthrPoolThreadFailure, Init_WhenCreationFailsPartWay_ReportsErrorAndFiniWai
     EXPECT_EQ(pool.numActive, 0);
 }
 
-TEST(XthrPoolThreadFailure, Init_WhenNoWorkerCanBeCreated_FiniReturnsAndTasksStayQueued) {
-    ThreadPool pool;
-    bool ran = false;
-    xthrPoolAddTask(&pool, [&] { ran = true; });
-    {
-        ThreadCreateFault fault(/*succeedFirst=*/0);
-        EXPECT_EQ(xthrPoolInit(&pool, 1), XERR_AGAIN);
-    }
-    EXPECT_EQ(pool.numActive, 0);
-    xthrPoolFini(&pool);
-    EXPECT_FALSE(ran) << "no worker exists to run the task";
-    std::lock_guard<std::mutex> lock(pool.mutex);
-    EXPECT_EQ(pool.tasks.size(), 1u);
-}
-
 }  // namespace
