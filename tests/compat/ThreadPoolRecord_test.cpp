@@ -159,25 +159,16 @@ TEST(ThreadPoolRecord, AddTask_FromRunningTask_RunsAfterCurrentAndEarlierQueuedT
     });
 }
 
-TEST(ThreadPoolRecord, AddTask_WhenSeveralWorkersAndAdders_RunsEveryTaskOnceSideBySide) {
+TEST(ThreadPoolRecord, Init_WhenSeveralWorkers_RunsTasksSideBySide) {
     onStackAndHeap([](ThreadPool& pool) {
         Gate secondStarted;
         std::atomic<bool> sawSecond{false};
-        std::atomic<int> runs{0};
         ASSERT_EQ(xthrPoolInit(&pool, 2), XERR_SUCCESS);
         // Only a second worker can open this gate.
         xthrPoolAddTask(&pool, [&] { sawSecond = secondStarted.wait(); });
         xthrPoolAddTask(&pool, [&] { secondStarted.open(); });
-        std::vector<std::thread> adders;
-        for (int t = 0; t < 4; ++t) {
-            adders.emplace_back([&] {
-                for (int i = 0; i < 500; ++i) xthrPoolAddTask(&pool, [&] { ++runs; });
-            });
-        }
-        for (std::thread& adder : adders) adder.join();
         xthrPoolFini(&pool);
         EXPECT_TRUE(sawSecond) << "two workers run two tasks at the same time";
-        EXPECT_EQ(runs, 2000);
     });
 }
 
