@@ -7,9 +7,23 @@
 #include <new>
 
 #include "xpl/XlogInternal.h"
+#include "xpl/XplLayout.h"
 #include "xpl/XplLoadOrder.h"
 
 namespace {
+
+XPL_LAYOUT_FIRST(XlogLogger, shouldLog)
+XPL_LAYOUT_FOLLOWS(XlogLogger, shouldLog, print)
+XPL_LAYOUT_LAST(XlogLogger, print)
+XPL_LAYOUT_FIRST(XlogState, file)
+XPL_LAYOUT_FOLLOWS(XlogState, file, fileName)
+XPL_LAYOUT_FOLLOWS(XlogState, fileName, processTag)
+XPL_LAYOUT_FOLLOWS(XlogState, processTag, utcOffset)
+XPL_LAYOUT_FOLLOWS(XlogState, utcOffset, levelNames)
+XPL_LAYOUT_FOLLOWS(XlogState, levelNames, modules)
+XPL_LAYOUT_FOLLOWS(XlogState, modules, formatFlags)
+XPL_LAYOUT_FOLLOWS(XlogState, formatFlags, logger)
+XPL_LAYOUT_LAST(XlogState, logger)
 
 // Android priorities by level; levels past the table (and negative ones) log
 // as verbose.

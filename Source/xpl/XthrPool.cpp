@@ -1,10 +1,10 @@
 #include "xpl/XthrPool.h"
 
 #include <cerrno>
-#include <cstddef>
 #include <utility>
 
 #include "xpl/Xlog.h"
+#include "xpl/XplLayout.h"
 #include "xpl/XplLoadOrder.h"
 #include "xpl/XthrDetached.h"
 
@@ -19,33 +19,16 @@ constexpr const char* kSourcePath = "Source/xpl/XthrPool";
 static_assert(XERR_AGAIN == EAGAIN && XERR_PERM == EPERM && XERR_INVAL == EINVAL,
               "result codes 1 to 133 are the Linux error numbers");
 
-// The record as a caller declares it. The unions around the synchronisation
+// The record as a caller declares it: the unions around the synchronisation
 // members must not move, widen or pad anything.
-struct DeclaredThreadPool {
-    std::mutex mutex;
-    std::condition_variable taskCond;
-    std::deque<std::function<void()>> tasks;
-    int32_t numThreads;
-    int32_t stop;
-    int32_t numActive;
-    std::condition_variable doneCond;
-};
-static_assert(sizeof(ThreadPool) == sizeof(DeclaredThreadPool), "the record has seven members");
-static_assert(alignof(ThreadPool) == alignof(DeclaredThreadPool), "same alignment");
-#pragma GCC diagnostic push
-#pragma GCC diagnostic ignored "-Winvalid-offsetof"
-#define XTHR_SAME_OFFSET(member)                                                        \
-    static_assert(offsetof(ThreadPool, member) == offsetof(DeclaredThreadPool, member), \
-                  #member " is where the declaration puts it")
-XTHR_SAME_OFFSET(mutex);
-XTHR_SAME_OFFSET(taskCond);
-XTHR_SAME_OFFSET(tasks);
-XTHR_SAME_OFFSET(numThreads);
-XTHR_SAME_OFFSET(stop);
-XTHR_SAME_OFFSET(numActive);
-XTHR_SAME_OFFSET(doneCond);
-#undef XTHR_SAME_OFFSET
-#pragma GCC diagnostic pop
+XPL_LAYOUT_FIRST(ThreadPool, mutex)
+XPL_LAYOUT_FOLLOWS(ThreadPool, mutex, taskCond)
+XPL_LAYOUT_FOLLOWS(ThreadPool, taskCond, tasks)
+XPL_LAYOUT_FOLLOWS(ThreadPool, tasks, numThreads)
+XPL_LAYOUT_FOLLOWS(ThreadPool, numThreads, stop)
+XPL_LAYOUT_FOLLOWS(ThreadPool, stop, numActive)
+XPL_LAYOUT_FOLLOWS(ThreadPool, numActive, doneCond)
+XPL_LAYOUT_LAST(ThreadPool, doneCond)
 
 void* workerMain(void* pool) {
     xthrPoolThreadEntry(static_cast<XthrPool*>(pool));

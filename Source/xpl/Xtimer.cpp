@@ -5,6 +5,7 @@
 #include <climits>
 #include <utility>
 
+#include "xpl/XplLayout.h"
 #include "xpl/XplLoadOrder.h"
 #include "xpl/XthrDetached.h"
 #include "xpl/Xtime.h"
@@ -12,6 +13,15 @@
 using android::base::ScopedLockAssertion;
 
 namespace {
+
+XPL_LAYOUT_FIRST(XtimerInfo, expiry)
+XPL_LAYOUT_FOLLOWS(XtimerInfo, expiry, callback)
+XPL_LAYOUT_LAST(XtimerInfo, callback)
+XPL_LAYOUT_FIRST(XtimerGlobals, cond)
+XPL_LAYOUT_FOLLOWS(XtimerGlobals, cond, mutex)
+XPL_LAYOUT_FOLLOWS(XtimerGlobals, mutex, threadStarted)
+XPL_LAYOUT_FOLLOWS(XtimerGlobals, threadStarted, timers)
+XPL_LAYOUT_LAST(XtimerGlobals, timers)
 
 // A wait is cut at this length and then re-evaluated, so that a far expiry
 // cannot overflow the clock arithmetic; ten years is no polling.

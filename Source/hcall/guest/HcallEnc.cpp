@@ -2,9 +2,14 @@
 
 #include "hcall/guest/HcallCall.h"
 #include "hcall/guest/HcallExchange.h"
+#include "xpl/XplLayout.h"
 #include "xpl/XplLoadOrder.h"
 
 using hcall::invoke;
+
+// The record holds the client and nothing else.
+XPL_LAYOUT_FIRST(HcallGuestGlobals, client)
+XPL_LAYOUT_LAST(HcallGuestGlobals, client)
 
 HcallGuestGlobals g_hcall XPL_LOAD_ORDER(XPL_LOAD_ORDER_HCALL);
 

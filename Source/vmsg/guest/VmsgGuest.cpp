@@ -10,8 +10,19 @@
 #include <cstring>
 
 #include "xpl/Xlog.h"
+#include "xpl/XplLayout.h"
 
 namespace {
+
+XPL_LAYOUT_FIRST(VmsgGuestClient, mFd)
+XPL_LAYOUT_FOLLOWS(VmsgGuestClient, mFd, mMaxHostBoundSize)
+XPL_LAYOUT_FOLLOWS(VmsgGuestClient, mMaxHostBoundSize, mMaxGuestBoundSize)
+XPL_LAYOUT_FOLLOWS(VmsgGuestClient, mMaxGuestBoundSize, mSpare)
+XPL_LAYOUT_FOLLOWS(VmsgGuestClient, mSpare, mGuestBoundOffset)
+XPL_LAYOUT_FOLLOWS(VmsgGuestClient, mGuestBoundOffset, mHostBoundBuf)
+XPL_LAYOUT_FOLLOWS(VmsgGuestClient, mHostBoundBuf, mGuestBoundBuf)
+XPL_LAYOUT_FOLLOWS(VmsgGuestClient, mGuestBoundBuf, mServiceName)
+XPL_LAYOUT_LAST(VmsgGuestClient, mServiceName)
 
 constexpr char kSource[] = "Source/vmsg/guest/VmsgGuest";
 constexpr char kConnect[] = "bool VmsgGuestClient::connect(VmsgServiceId)";
