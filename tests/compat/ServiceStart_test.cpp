@@ -7,6 +7,8 @@
 
 #include <gtest/gtest.h>
 
+#include <cstdarg>
+#include <cstdio>
 #include <mutex>
 #include <string>
 #include <thread>
@@ -31,15 +33,36 @@ int workers() {
     return g_thr_pool.numActive;
 }
 
-// Regression guard: running the support library's start again would reset
-// the levels to "*:I XMEM:D".
-TEST(ServiceStart, Start_AfterAFailedConnect_KeepsLevelsSetSinceAndConnects) {
+std::string gHcallErrors;
+
+// Keeps the HCALL error lines with the source path and line they name.
+void keepHcallErrors(int level, int module, const char* file, const char*, int line,
+                     const char* format, ...) {
+    if (module != XLOG_MODULE_HCALL || level != XLOG_LEVEL_E) return;
+    char text[256];
+    va_list args;
+    va_start(args, format);
+    std::vsnprintf(text, sizeof(text), format, args);
+    va_end(args);
+    gHcallErrors += std::string(file) + ":" + std::to_string(line) + " " + text + "\n";
+}
+
+// Running the support library's start again would reinstall the default
+// logger and reset the levels to "*:I XMEM:D". The connection failure names
+// the source path and line log readers have always matched it by.
+TEST(ServiceStart, Start_AfterAFailedConnect_KeepsLoggerAndLevelsSetSinceAndConnects) {
     ChildOutcome child = runInChild([]() -> std::string {
         VmsgDeviceScript script;
         script.openErrno = ENOENT;
         vmsgDeviceConfigure(script);
         bridge::startService();
+        const XlogLogger logger = {xlogShouldLog, keepHcallErrors};
+        xlogLibInit(&logger, "", "");
         if (xlogSetLevels("HCALL:V") != XERR_SUCCESS) return "levels refused";
+        bridge::startService();
+        if (gHcallErrors != "server/native/com_zelvane_server_KivHostCallService:74 "
+                            "hcallLibInitGuest failed, error -1\n")
+            return "connection failure logged as: " + gHcallErrors;
         vmsgDeviceConfigure(VmsgDeviceScript());
         bridge::startService();
         if (!xlogShouldLog(XLOG_MODULE_HCALL, XLOG_LEVEL_V)) return "the levels were reset";
