@@ -17,6 +17,7 @@
 #include "VmsgDeviceModel.h"
 #include "support/ChildProcess.h"
 #include "support/Gate.h"
+#include "threading/ThreadCreateFault.h"
 #include "xpl/Xlog.h"
 #include "xpl/XthrPool.h"
 
@@ -67,6 +68,22 @@ TEST(ServiceStart, Start_AfterAFailedConnect_KeepsLoggerAndLevelsSetSinceAndConn
         bridge::startService();
         if (!xlogShouldLog(XLOG_MODULE_HCALL, XLOG_LEVEL_V)) return "the levels were reset";
         if (countEvents(VmsgDeviceEventKind::Connect) != 1) return "no connection on the retry";
+        return workers() == 1 ? "" : "no worker after the retry";
+    });
+    EXPECT_TRUE(child.ok()) << child.message;
+}
+
+// Regression: a worker that could not be created was taken for started, and
+// every later native_init answered "already started" with no worker behind.
+TEST(ServiceStart, Start_WhenTheWorkerCouldNotBeCreated_StartsItOnTheNextCall) {
+    ChildOutcome child = runInChild([]() -> std::string {
+        {
+            ThreadCreateFault fault(/*succeedFirst=*/0);
+            bridge::startService();
+        }
+        if (workers() != 0) return "a worker that was never created counts";
+        bridge::startService();
+        if (countEvents(VmsgDeviceEventKind::Open) != 1) return "the device was opened again";
         return workers() == 1 ? "" : "no worker after the retry";
     });
     EXPECT_TRUE(child.ok()) << child.message;
