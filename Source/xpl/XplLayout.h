@@ -6,9 +6,9 @@
 
 #include <cstddef>
 
-#define XPL_ALIGNED_END(Record, member, next)                                                  \
-    ((offsetof(Record, member) + sizeof(Record::member) + alignof(next) - 1) / alignof(next) * \
-     alignof(next))
+#define XPL_ALIGNED_END(Record, member, next)                                            \
+    ((offsetof(Record, member) + sizeof(decltype(Record::member)) + alignof(next) - 1) / \
+     alignof(next) * alignof(next))
 
 // offsetof on records holding standard containers is supported by every
 // compiler the library is built with, though not promised by the language.

@@ -39,8 +39,7 @@ void* workerMain(void* pool) {
 
 ThreadPool g_thr_pool XPL_LOAD_ORDER(XPL_LOAD_ORDER_THR_POOL);
 
-ThreadPool::ThreadPool()
-    : mutex(), taskCond(), tasks(), numThreads(0), stop(0), numActive(0), doneCond() {}
+ThreadPool::ThreadPool() : mutex(), taskCond(), numThreads(0), stop(0), numActive(0), doneCond() {}
 
 ThreadPool::~ThreadPool() {
     std::deque<std::function<void()>> dropped;

@@ -15,7 +15,9 @@ namespace {
 // on a destroyed mutex).
 union LockStorage {
     constexpr LockStorage() : mutex() {}
-    ~LockStorage() {}
+    // Not defaulted: where std::mutex has a destructor, a defaulted one would
+    // be deleted.
+    ~LockStorage() {}  // NOLINT(modernize-use-equals-default)
     std::mutex mutex;
 };
 LockStorage gLockStorage;
