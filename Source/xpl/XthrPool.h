@@ -41,7 +41,7 @@ struct XPL_EXPORT ThreadPool {
     };
     std::deque<std::function<void()>> tasks GUARDED_BY(mutex);
     int32_t numThreads GUARDED_BY(mutex);  // recorded only
-    int32_t stop GUARDED_BY(mutex);        // 1 once xthrPoolFini has begun
+    int32_t stop GUARDED_BY(mutex);        // 1 once xthrPoolFini has begun, 2 once destroyed
     int32_t numActive GUARDED_BY(mutex);   // workers that have not yet exited
     union {
         std::condition_variable doneCond;
