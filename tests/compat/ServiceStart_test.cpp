@@ -61,8 +61,9 @@ TEST(ServiceStart, Start_AfterAFailedConnect_KeepsLoggerAndLevelsSetSinceAndConn
         xlogLibInit(&logger, "", "");
         if (xlogSetLevels("HCALL:V") != XERR_SUCCESS) return "levels refused";
         bridge::startService();
-        if (gHcallErrors != "server/native/com_zelvane_server_KivHostCallService:74 "
-                            "hcallLibInitGuest failed, error -1\n")
+        if (gHcallErrors !=
+            "server/native/com_zelvane_server_KivHostCallService:74 "
+            "hcallLibInitGuest failed, error -1\n")
             return "connection failure logged as: " + gHcallErrors;
         vmsgDeviceConfigure(VmsgDeviceScript());
         bridge::startService();
