@@ -51,9 +51,11 @@ fuzz: deps
 	fuzz/run-fuzz.sh build-fuzz $(FUZZ_SECONDS)
 
 # The shipped library as the platform build takes it: Android.bp parses, is
-# formatted and lists the CMake sources; clang-tidy runs clean over the library.
+# formatted and lists the CMake sources; clang's thread-safety analysis and
+# clang-tidy run clean over the library.
 lint: deps
 	tools/lint/check-android-bp.sh
+	tools/lint/check-thread-safety.sh
 	cmake -S . -B build -DCMAKE_EXPORT_COMPILE_COMMANDS=ON $(CMAKE_FLAGS)
 	tools/lint/run-clang-tidy.sh build $(JOBS)
 

@@ -15,3 +15,9 @@ function(android_host_library name)
 endfunction()
 
 android_host_library(log)
+
+# libbase's header-only parts (unique_fd, thread annotations): the include
+# folder alone, so nothing of libbase is linked.
+add_library(android::base_headers INTERFACE IMPORTED GLOBAL)
+set_target_properties(android::base_headers PROPERTIES
+  INTERFACE_INCLUDE_DIRECTORIES ${ANDROID_HOST_INCLUDE_DIR})

@@ -7,7 +7,8 @@ packages=(
   cmake make g++ clang libclang-rt-14-dev
   libgtest-dev libgmock-dev libbenchmark-dev libboost-dev
   openjdk-17-jdk-headless junit5
-  android-liblog-dev android-libnativehelper-dev android-libcutils-dev
+  android-liblog-dev android-libnativehelper-dev android-libcutils-dev android-libbase-dev
+  libc++-14-dev libc++abi-14-dev
   util-linux
   blueprint-tools clang-tidy
 )

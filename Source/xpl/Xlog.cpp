@@ -7,8 +7,23 @@
 #include <new>
 
 #include "xpl/XlogInternal.h"
+#include "xpl/XplLayout.h"
+#include "xpl/XplLoadOrder.h"
 
 namespace {
+
+XPL_LAYOUT_FIRST(XlogLogger, shouldLog)
+XPL_LAYOUT_FOLLOWS(XlogLogger, shouldLog, print)
+XPL_LAYOUT_LAST(XlogLogger, print)
+XPL_LAYOUT_FIRST(XlogState, file)
+XPL_LAYOUT_FOLLOWS(XlogState, file, fileName)
+XPL_LAYOUT_FOLLOWS(XlogState, fileName, processTag)
+XPL_LAYOUT_FOLLOWS(XlogState, processTag, utcOffset)
+XPL_LAYOUT_FOLLOWS(XlogState, utcOffset, levelNames)
+XPL_LAYOUT_FOLLOWS(XlogState, levelNames, modules)
+XPL_LAYOUT_FOLLOWS(XlogState, modules, formatFlags)
+XPL_LAYOUT_FOLLOWS(XlogState, formatFlags, logger)
+XPL_LAYOUT_LAST(XlogState, logger)
 
 // Android priorities by level; levels past the table (and negative ones) log
 // as verbose.
@@ -34,6 +49,7 @@ XlogState* createState() {
     auto* state = new XlogState();
     state->logger.shouldLog = xlogShouldLog;
     state->logger.print = xlogPrint;
+    g_xlog = state;
     return state;
 }
 
@@ -51,8 +67,12 @@ XlogState* xlogState() {
     return state;
 }
 
-// Forced at load as well, so that g_xlog points at the record from then on.
-XlogState* g_xlog = xlogState();
+// Points at the record from its creation, which happens at its rank in the
+// load order or at an earlier first use.
+XlogState* g_xlog = nullptr;
+namespace {
+const XplLoadStep kCreateLogger XPL_LOAD_ORDER(XPL_LOAD_ORDER_XLOG)([] { xlogState(); });
+}  // namespace
 
 XlogLogger* xlogGetLogger() { return &xlogState()->logger; }
 

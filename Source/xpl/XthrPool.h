@@ -4,6 +4,9 @@
 // runs, so a task may add tasks to its own pool. Calling order: the record
 // exists, then xthrPoolInit, then any number of xthrPoolAddTask from any
 // thread, then at most one xthrPoolFini from a thread that is not a worker.
+//
+// The record is exactly its seven members: callers declare pools of their own
+// from it, so nothing may be added (XthrPool.cpp asserts the layout).
 #pragma once
 
 #include <condition_variable>
@@ -14,14 +17,16 @@
 
 #include "xpl/Xerr.h"
 #include "xpl/XplExport.h"
+#include "xpl/XplThreadAnnotations.h"
 
 struct XPL_EXPORT ThreadPool {
     ThreadPool();
-    // Drops queued tasks unrun. While a detached worker is still alive (the
-    // process-wide pool is never finished) the synchronisation members and
-    // the queue are left constructed, so that a worker waiting on `taskCond`
-    // or returning from its task during process exit touches live objects;
-    // it sees `exiting` and leaves without running anything more.
+    // Drops queued tasks unrun and marks the pool as being destroyed (`stop`
+    // becomes XTHR_POOL_DESTROYED), after which a worker that wakes or comes
+    // back from its task leaves at once and an adder is refused quietly.
+    // While a detached worker is still alive (the process-wide pool is never
+    // finished) the mutex and condition variables are left constructed so
+    // that it touches live objects during process exit.
     ~ThreadPool();
     ThreadPool(const ThreadPool&) = delete;
     ThreadPool& operator=(const ThreadPool&) = delete;
@@ -34,18 +39,18 @@ struct XPL_EXPORT ThreadPool {
     union {
         std::condition_variable taskCond;
     };
-    union {
-        std::deque<std::function<void()>> tasks;
-    };
-    int32_t numThreads;  // recorded only
-    int32_t stop;        // 1 once xthrPoolFini has begun
-    int32_t numActive;   // workers that have not yet exited
+    std::deque<std::function<void()>> tasks GUARDED_BY(mutex);
+    int32_t numThreads GUARDED_BY(mutex);  // recorded only
+    int32_t stop GUARDED_BY(mutex);        // 1 once xthrPoolFini has begun, 2 once destroyed
+    int32_t numActive GUARDED_BY(mutex);   // workers that have not yet exited
     union {
         std::condition_variable doneCond;
     };
-    int32_t exiting;  // 1 once the destructor has begun; workers leave at once
 };
 typedef ThreadPool XthrPool;
+
+// The value of `stop` once the record's destructor has begun.
+constexpr int32_t XTHR_POOL_DESTROYED = 2;
 
 XPL_EXPORT extern ThreadPool g_thr_pool;
 

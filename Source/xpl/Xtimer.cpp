@@ -5,10 +5,23 @@
 #include <climits>
 #include <utility>
 
+#include "xpl/XplLayout.h"
+#include "xpl/XplLoadOrder.h"
 #include "xpl/XthrDetached.h"
 #include "xpl/Xtime.h"
 
+using android::base::ScopedLockAssertion;
+
 namespace {
+
+XPL_LAYOUT_FIRST(XtimerInfo, expiry)
+XPL_LAYOUT_FOLLOWS(XtimerInfo, expiry, callback)
+XPL_LAYOUT_LAST(XtimerInfo, callback)
+XPL_LAYOUT_FIRST(XtimerGlobals, cond)
+XPL_LAYOUT_FOLLOWS(XtimerGlobals, cond, mutex)
+XPL_LAYOUT_FOLLOWS(XtimerGlobals, mutex, threadStarted)
+XPL_LAYOUT_FOLLOWS(XtimerGlobals, threadStarted, timers)
+XPL_LAYOUT_LAST(XtimerGlobals, timers)
 
 // A wait is cut at this length and then re-evaluated, so that a far expiry
 // cannot overflow the clock arithmetic; ten years is no polling.
@@ -18,7 +31,7 @@ constexpr long long kMaxWaitUs = 10LL * 366 * 24 * 3600 * 1000000;
 // another file's static initialiser finds the record whatever the order of
 // initialisation. Never freed: the timer thread may run during exit.
 XtimerGlobals* timerGlobals() {
-    static auto* const globals = new XtimerGlobals();
+    static auto* const globals = g_xtimer = new XtimerGlobals();
     return globals;
 }
 
@@ -33,7 +46,12 @@ void* timerThreadMain(void*) { xtimerThreadEntry(); }
 
 }  // namespace
 
-XtimerGlobals* g_xtimer = timerGlobals();
+// Points at the record from its creation, at its rank in the load order or at
+// an earlier first use.
+XtimerGlobals* g_xtimer = nullptr;
+namespace {
+const XplLoadStep kCreateTimer XPL_LOAD_ORDER(XPL_LOAD_ORDER_XTIMER)([] { timerGlobals(); });
+}  // namespace
 
 xerr_t xtimerLibInit() { return XERR_SUCCESS; }
 
@@ -47,14 +65,20 @@ xerr_t xtimerStart(long long delay, std::function<void()> callback) {
         timer->threadStarted = 1;
     }
     long long expiry = expiryAfter(xtimeNow(), delay);
-    timer->timers.emplace(expiry, XtimerInfo{expiry, std::move(callback)});
-    timer->cond.notify_one();
+    auto entry = timer->timers.emplace(expiry, XtimerInfo{expiry, std::move(callback)});
+    // Behind the head the entry changes nothing for the timer thread, which
+    // wakes for the head anyway and then finds it; only a new head moves its
+    // wake-up time.
+    if (entry == timer->timers.begin()) timer->cond.notify_one();
     return XERR_SUCCESS;
 }
 
 void xtimerThreadEntry() {
     XtimerGlobals* timer = timerGlobals();
     std::unique_lock<std::mutex> lock(timer->mutex);
+    // Held throughout but for the waits and the callbacks, which release it
+    // through `lock`.
+    ScopedLockAssertion held(timer->mutex);
     for (;;) {
         if (timer->timers.empty()) {
             timer->cond.wait(lock);

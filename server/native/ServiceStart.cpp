@@ -11,6 +11,7 @@
 #include "hcall/guest/HcallEnc.h"
 #include "xpl/Xlog.h"
 #include "xpl/Xpl.h"
+#include "xpl/XplThreadAnnotations.h"
 #include "xpl/XthrPool.h"
 
 std::atomic<bool> g_debug_enabled{false};
@@ -30,9 +31,9 @@ constexpr int kConnectFailureLine = 74;
 // a step that succeeded nor skips one that failed.
 struct StartState {
     std::mutex mutex;
-    bool supportStarted = false;
-    bool connected = false;
-    bool workerStarted = false;
+    bool supportStarted GUARDED_BY(mutex) = false;
+    bool connected GUARDED_BY(mutex) = false;
+    bool workerStarted GUARDED_BY(mutex) = false;
 };
 StartState gStart;
 

@@ -107,6 +107,17 @@ TEST_F(HcallLogTest, Lines_OfFilledParameters_ShowTheBufferBeforeAndAfterFilling
     expectLines("xerr_t hcallGetTimeInfoRpc(u64 *, char *, i32)", "%s(%p, %s, %d)\n",
                 "hcallGetTimeInfoRpc(" + pointer(&time) + ", after, 16)\n",
                 "returning [0] from hcallGetTimeInfoRpc(" + pointer(&time) + ", tz, 16)\n");
+
+    // A buffer of capacity 0 has no byte the call may read, whatever the
+    // caller's memory holds; a null target is skipped, and the result stands.
+    EXPECT_EQ(hcallGetPropsRpc(buffer, 0, nullptr), 0);
+    expectLines("xerr_t hcallGetPropsRpc(char *, i32, i32 *)", "%s(%.*s, %d, %p)\n",
+                "hcallGetPropsRpc(, 0, (nil))\n",
+                "returning [0] from hcallGetPropsRpc(, 0, (nil))\n");
+    EXPECT_STREQ(buffer, "tz");
+    std::strcpy(buffer, "before");
+    EXPECT_EQ(hcallGetTimeInfoRpc(nullptr, buffer, 16), 0);
+    EXPECT_STREQ(buffer, "tz") << "the buffer after the skipped target is still filled";
 }
 
 TEST_F(HcallLogTest, ExitLine_OfLaunchQuery_PrintsTheReplyByte) {

@@ -168,28 +168,21 @@ TEST_F(VmsgGuestClientTest, Disconnect_WhenConnected_ReleasesDeviceAndKeepsTheRe
     EXPECT_EQ(log.lines(XLOG_MODULE_VMSG)[0].text,
               calledFor(log.lines(XLOG_MODULE_VMSG)[0], "hcal"));
     EXPECT_EQ(log.lines(XLOG_MODULE_VMSG)[0].function, kDisconnect);
-}
 
-// Regression: capacities outlive a disconnect, so an exchange was let through
-// onto an unmapped buffer and a closed descriptor.
-TEST_F(VmsgGuestClientTest, Exchange_AfterDisconnect_IsRefusedAndDisconnectOnlyTraces) {
-    ASSERT_TRUE(client.connect(kHcal));
-    client.disconnect();
+    // Regression: capacities outlive a disconnect, so an exchange was let
+    // through onto an unmapped buffer and a closed descriptor.
     vmsgDeviceReset();
-    log.clear();
-
     EXPECT_EQ(client.getHostBoundBuffer(16), nullptr);
     EXPECT_EQ(client.processRequest(nullptr, 16), nullptr);
     client.disconnect();
-    EXPECT_EQ(vmsgDeviceEvents().size(), 0u) << "nothing reaches the device";
-    EXPECT_EQ(log.texts(XLOG_MODULE_VMSG).back(),
-              calledFor(log.lines(XLOG_MODULE_VMSG).back(), "hcal"));
+    EXPECT_EQ(vmsgDeviceEvents().size(), 0u) << "nothing more reaches the device";
 }
 
 // The connection failures, one row each: the error line, and the client left
 // unconnected with no descriptor behind. The last two rows guard regressions:
 // a mapping length that wrapped in 32 bits mapped a sliver, and a host-bound
-// capacity beyond the mapping let requests run past its end.
+// capacity beyond the mapping let requests run past its end; neither layout
+// reaches mmap, so neither may say that mmap failed.
 TEST_F(VmsgGuestClientTest, Connect_WhenAStepFails_ReportsAndStaysUnconnected) {
     struct Row {
         const char* what;
@@ -198,6 +191,7 @@ TEST_F(VmsgGuestClientTest, Connect_WhenAStepFails_ReportsAndStaysUnconnected) {
         std::string line;  // after "<signature>: service "
     };
     const std::string e = ", errno ";
+    const std::string layout = "impossible buffer layout: mMaxHostBoundSize ";
     const Row rows[] = {
         {"open", [](VmsgDeviceScript& s) { s.openErrno = ENOENT; }, kHcal,
          "hcal: open failed for /dev/kivvmsg"},
@@ -219,14 +213,14 @@ TEST_F(VmsgGuestClientTest, Connect_WhenAStepFails_ReportsAndStaysUnconnected) {
              s.guestBoundOffset = 0xFFFFF000;
              s.guestBoundCapacity = 0x2000;
          },
-         kHcal, "hcal: mmap() failed: size 4294971392" + e + std::to_string(EOVERFLOW)},
+         kHcal, "hcal: " + layout + "4096, mMaxGuestBoundSize 8192, mGuestBoundOffset 4294963200"},
         {"host-bound beyond mapping",
          [](VmsgDeviceScript& s) {
              s.hostBoundCapacity = 65536;
              s.guestBoundOffset = 256;
              s.guestBoundCapacity = 256;
          },
-         kHcal, "hcal: mmap() failed: size 512" + e + std::to_string(EINVAL)},
+         kHcal, "hcal: " + layout + "65536, mMaxGuestBoundSize 256, mGuestBoundOffset 256"},
     };
     for (const Row& row : rows) {
         VmsgGuestClient fresh;

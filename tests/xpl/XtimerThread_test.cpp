@@ -10,7 +10,7 @@
 #include <thread>
 #include <vector>
 
-#include "threading/Gate.h"
+#include "support/Gate.h"
 #include "threading/ThreadCreateFault.h"
 #include "xpl/Xtimer.h"
 

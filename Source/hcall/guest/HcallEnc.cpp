@@ -2,20 +2,29 @@
 
 #include "hcall/guest/HcallCall.h"
 #include "hcall/guest/HcallExchange.h"
+#include "xpl/XplLayout.h"
+#include "xpl/XplLoadOrder.h"
 
 using hcall::invoke;
 
-HcallGuestGlobals g_hcall;
+// The record holds the client and nothing else.
+XPL_LAYOUT_FIRST(HcallGuestGlobals, client)
+XPL_LAYOUT_LAST(HcallGuestGlobals, client)
+
+HcallGuestGlobals g_hcall XPL_LOAD_ORDER(XPL_LOAD_ORDER_HCALL);
 
 xerr_t hcallLibInitGuest() {
-    std::lock_guard<std::mutex> lock(hcall::connectionLock());
+    std::lock_guard<std::mutex> lock(hcall::gExchangeLock);
     return g_hcall.client.connect(HCALL_SERVICE_ID) ? XERR_SUCCESS : XERR_FAILURE;
 }
 
-void hcallGetBufferSizes(int* maxHostBoundSize, int* maxGuestBoundSize) {
-    std::lock_guard<std::mutex> lock(hcall::connectionLock());
-    if (maxHostBoundSize) *maxHostBoundSize = int(g_hcall.client.mMaxHostBoundSize);
-    if (maxGuestBoundSize) *maxGuestBoundSize = int(g_hcall.client.mMaxGuestBoundSize);
+// A host call has no time limit, so this must not queue behind one for the
+// exchange lock. The capacities change only inside connect, which stores each
+// atomically; each is read atomically here.
+void hcallGetBufferSizes(int* maxHostBoundSize, int* maxGuestBoundSize) NO_THREAD_SAFETY_ANALYSIS {
+    const VmsgGuestClient& client = g_hcall.client;
+    if (maxHostBoundSize) *maxHostBoundSize = int(vmsgLoadCapacity(client.mMaxHostBoundSize));
+    if (maxGuestBoundSize) *maxGuestBoundSize = int(vmsgLoadCapacity(client.mMaxGuestBoundSize));
 }
 
 // Every exported operation has exactly the type its catalogue line describes.

@@ -4,11 +4,13 @@
 #pragma once
 
 #include <cstdint>
+#include <mutex>
 
 #include "hcall/guest/HcallCatalogue.h"
 #include "vmsg/guest/VmsgGuest.h"
 #include "xpl/Xerr.h"
 #include "xpl/XplExport.h"
+#include "xpl/XplThreadAnnotations.h"
 
 constexpr VmsgServiceId HCALL_SERVICE_ID = hcall::kServiceId;
 
@@ -18,20 +20,27 @@ struct HcallMsgHeader {
 };
 static_assert(sizeof(HcallMsgHeader) == hcall::kHeaderSize, "the header is two u32 words");
 
+namespace hcall {
+// Serialises whole exchanges on g_hcall, and its start and end (see
+// HcallExchange.h). Never destroyed. Not exported.
+extern std::mutex& gExchangeLock;
+}  // namespace hcall
+
 // The one host-call connection. Its destructor runs at unload or process exit
 // and disconnects the client unless an exchange is still in progress on
 // another thread; then the mapping and descriptor are left to the process's
 // end, because unmapping them would pull the buffers out from under it.
 struct HcallGuestGlobals {
     ~HcallGuestGlobals();
-    VmsgGuestClient client;
+    VmsgGuestClient client GUARDED_BY(hcall::gExchangeLock);
 };
 
 XPL_EXPORT extern HcallGuestGlobals g_hcall;
 
 // Connects g_hcall to the host-call service: 0 on success, -1 on failure.
 XPL_EXPORT xerr_t hcallLibInitGuest();
-// The host-bound and guest-bound capacities; either pointer may be null.
+// The host-bound and guest-bound capacities; either pointer may be null. Never
+// waits: it reads them without the exchange lock.
 XPL_EXPORT void hcallGetBufferSizes(int* maxHostBoundSize, int* maxGuestBoundSize);
 
 // The operations. Each returns the host's result, or -1 when the request does

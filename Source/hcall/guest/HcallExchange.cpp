@@ -1,25 +1,37 @@
 #include "hcall/guest/HcallExchange.h"
 
 #include <atomic>
+#include <mutex>
 
-#include "hcall/guest/HcallEnc.h"
 #include "xpl/Xlog.h"
 
 namespace hcall {
 namespace {
 
-// Both constant-initialised and trivially destroyed, so they stay usable by a
-// thread that is still in an exchange while the process runs its exit-time
-// destructors.
-std::mutex gLock;
+// Built at compile time and never destroyed, so that a thread still in an
+// exchange while the process runs its exit-time destructors, and g_hcall's
+// own destructor, always meet a live lock (a C++ library whose mutex has a
+// destructor would otherwise destroy it at exit, and some C libraries abort
+// on a destroyed mutex).
+union LockStorage {
+    constexpr LockStorage() : mutex() {}
+    // Not defaulted: where std::mutex has a destructor, a defaulted one would
+    // be deleted.
+    ~LockStorage() {}  // NOLINT(modernize-use-equals-default)
+    std::mutex mutex;
+};
+LockStorage gLockStorage;
+
 // Set once g_hcall is being destroyed; later exchanges are refused.
 std::atomic<bool> gClosed{false};
 
 }  // namespace
 
-std::mutex& connectionLock() { return gLock; }
+std::mutex& gExchangeLock = gLockStorage.mutex;
 
-Exchange::Exchange() : mGuard(gLock) {}
+Exchange::Exchange() { gExchangeLock.lock(); }
+
+Exchange::~Exchange() { gExchangeLock.unlock(); }
 
 uint8_t* Exchange::requestBuffer(const char* function, size_t requestLength, size_t replyLength) {
     VmsgGuestClient& client = g_hcall.client;
@@ -56,6 +68,8 @@ HcallGuestGlobals::~HcallGuestGlobals() {
     hcall::gClosed.store(true);
     // An exchange still running on another thread keeps the buffers: leave the
     // mapping and the descriptor to the end of the process.
-    std::unique_lock<std::mutex> lock(hcall::gLock, std::try_to_lock);
-    if (lock.owns_lock() && client.mFd >= 0) client.disconnect();
+    if (hcall::gExchangeLock.try_lock()) {
+        if (client.mFd >= 0) client.disconnect();
+        hcall::gExchangeLock.unlock();
+    }
 }

@@ -1,5 +1,6 @@
 #include "vmsg/guest/VmsgGuest.h"
 
+#include <android-base/unique_fd.h>
 #include <fcntl.h>
 #include <sys/ioctl.h>
 #include <sys/mman.h>
@@ -8,10 +9,20 @@
 #include <cerrno>
 #include <cstring>
 
-#include "vmsg/guest/VmsgFd.h"
 #include "xpl/Xlog.h"
+#include "xpl/XplLayout.h"
 
 namespace {
+
+XPL_LAYOUT_FIRST(VmsgGuestClient, mFd)
+XPL_LAYOUT_FOLLOWS(VmsgGuestClient, mFd, mMaxHostBoundSize)
+XPL_LAYOUT_FOLLOWS(VmsgGuestClient, mMaxHostBoundSize, mMaxGuestBoundSize)
+XPL_LAYOUT_FOLLOWS(VmsgGuestClient, mMaxGuestBoundSize, mSpare)
+XPL_LAYOUT_FOLLOWS(VmsgGuestClient, mSpare, mGuestBoundOffset)
+XPL_LAYOUT_FOLLOWS(VmsgGuestClient, mGuestBoundOffset, mHostBoundBuf)
+XPL_LAYOUT_FOLLOWS(VmsgGuestClient, mHostBoundBuf, mGuestBoundBuf)
+XPL_LAYOUT_FOLLOWS(VmsgGuestClient, mGuestBoundBuf, mServiceName)
+XPL_LAYOUT_LAST(VmsgGuestClient, mServiceName)
 
 constexpr char kSource[] = "Source/vmsg/guest/VmsgGuest";
 constexpr char kConnect[] = "bool VmsgGuestClient::connect(VmsgServiceId)";
@@ -44,7 +55,7 @@ bool VmsgGuestClient::connect(VmsgServiceId id) {
     // caller's to have released.
     mFd = -1;
 
-    VmsgFd fd(::open(VMSG_DEVICE_PATH, O_RDWR));
+    android::base::unique_fd fd(::open(VMSG_DEVICE_PATH, O_RDWR));
     if (fd.get() < 0) {
         VMSG_ERROR(kConnect, "%s: service %s: open failed for %s", kConnect, mServiceName.c_str(),
                    VMSG_DEVICE_PATH);
@@ -60,8 +71,8 @@ bool VmsgGuestClient::connect(VmsgServiceId id) {
                    mServiceName.c_str(), ret, error);
         return false;
     }
-    mMaxHostBoundSize = args.maxHostBoundSize;
-    mMaxGuestBoundSize = args.maxGuestBoundSize;
+    vmsgStoreCapacity(mMaxHostBoundSize, args.maxHostBoundSize);
+    vmsgStoreCapacity(mMaxGuestBoundSize, args.maxGuestBoundSize);
     mSpare = args.spare;
     mGuestBoundOffset = args.guestBoundOffset;
     VMSG_TRACE(kConnect, "mMaxHostBoundSize %u, mMaxGuestBoundSize %u service %s",
@@ -71,17 +82,17 @@ bool VmsgGuestClient::connect(VmsgServiceId id) {
     // that wraps in 32 bits, or a host-bound buffer running past the mapping,
     // would let a request or a reply overrun the mapping.
     size_t length = size_t(mGuestBoundOffset) + mMaxGuestBoundSize;
-    void* map = MAP_FAILED;
-    int error = 0;
-    if (length > UINT32_MAX) {
-        error = EOVERFLOW;
-    } else if (mMaxHostBoundSize > length) {
-        error = EINVAL;
-    } else {
-        map = ::mmap(nullptr, length, PROT_READ | PROT_WRITE, MAP_SHARED, fd.get(), 0);
-        if (map == MAP_FAILED) error = errno;
+    if (length > UINT32_MAX || mMaxHostBoundSize > length) {
+        VMSG_ERROR(kConnect,
+                   "%s: service %s: impossible buffer layout: mMaxHostBoundSize %u, "
+                   "mMaxGuestBoundSize %u, mGuestBoundOffset %u",
+                   kConnect, mServiceName.c_str(), mMaxHostBoundSize, mMaxGuestBoundSize,
+                   mGuestBoundOffset);
+        return false;
     }
+    void* map = ::mmap(nullptr, length, PROT_READ | PROT_WRITE, MAP_SHARED, fd.get(), 0);
     if (map == MAP_FAILED) {
+        int error = errno;
         VMSG_ERROR(kConnect, "%s: service %s: mmap() failed: size %zu, errno %d", kConnect,
                    mServiceName.c_str(), length, error);
         return false;

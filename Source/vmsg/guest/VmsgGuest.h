@@ -35,6 +35,9 @@ class XPL_EXPORT VmsgGuestClient {
     void* processRequest(void* request, uint32_t len);
 
     int32_t mFd = -1;
+    // The capacities change only inside connect, which stores each with
+    // vmsgStoreCapacity, so a reader without the caller's lock can take them
+    // with vmsgLoadCapacity.
     uint32_t mMaxHostBoundSize = 0;
     uint32_t mMaxGuestBoundSize = 0;
     uint32_t mSpare = 0;
@@ -43,3 +46,10 @@ class XPL_EXPORT VmsgGuestClient {
     void* mGuestBoundBuf = nullptr;
     std::string mServiceName;
 };
+
+inline uint32_t vmsgLoadCapacity(const uint32_t& capacity) {
+    return __atomic_load_n(&capacity, __ATOMIC_RELAXED);
+}
+inline void vmsgStoreCapacity(uint32_t& capacity, uint32_t value) {
+    __atomic_store_n(&capacity, value, __ATOMIC_RELAXED);
+}
