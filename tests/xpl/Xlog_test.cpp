@@ -77,7 +77,9 @@ TEST(Xlog, Fatal_PrintsTheFatalLineThenBreaks) {
         static LogRecorder* recorder = new LogRecorder();
         recorder->clear();
         // Runs inside the break's exit: the fatal line came first.
-        std::atexit([] { _exit(recorder->texts(XLOG_MODULE_XTHR).size() == 1 ? 1 : 3); });
+        std::atexit([] {
+            if (recorder->texts(XLOG_MODULE_XTHR).size() != 1) _exit(3);
+        });
         XLOG_FATAL(XLOG_MODULE_XTHR, "f", "g", "h");
         return "the break returned";
     });
