@@ -4,8 +4,6 @@
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 
-#include <fstream>
-#include <sstream>
 #include <string>
 #include <thread>
 #include <vector>
@@ -17,20 +15,13 @@
 
 namespace {
 
-std::string contentOf(const std::string& path) {
-    std::stringstream text;
-    text << std::ifstream(path, std::ios::binary).rdbuf();
-    return text.str();
-}
-
 TEST(XlogKmsg, Print_WritesEachMessageAsFormattedFlushedAndOnOneStream) {
     TempDir dir;
-    const std::string kmsg = dir / "kmsg";
     ChildOutcome outcome = runInChild([&]() -> std::string {
-        setenv("HOSTCALL_TEST_KMSG", kmsg.c_str(), 1);
+        setenv("HOSTCALL_TEST_KMSG", (dir / "kmsg").c_str(), 1);
         AndroidLogCapture capture;
         xlogPrint(XLOG_LEVEL_W, XLOG_MODULE_VMSG, "f", "g", 1, "%s=%d;", "alpha", 7);
-        if (contentOf(kmsg) != "alpha=7;") return "not flushed at once: " + contentOf(kmsg);
+        if (dir.read("kmsg") != "alpha=7;") return "not flushed at once: " + dir.read("kmsg");
         std::vector<std::thread> threads;
         for (int i = 0; i < 8; ++i) {
             threads.emplace_back(
@@ -38,7 +29,7 @@ TEST(XlogKmsg, Print_WritesEachMessageAsFormattedFlushedAndOnOneStream) {
         }
         for (std::thread& thread : threads) thread.join();
         // A second opening in "w+" mode would have cut what came before.
-        const std::string written = contentOf(kmsg);
+        const std::string written = dir.read("kmsg");
         for (int i = 0; i < 8; ++i) {
             if (written.find("|" + std::to_string(i)) == std::string::npos) return written;
         }
@@ -55,8 +46,7 @@ TEST(XlogKmsg, WhenDeviceCannotBeOpened_AndroidLogStillGetsLinesAndNoRetry) {
         xlogPrint(XLOG_LEVEL_E, XLOG_MODULE_XLOG, "f", "g", 1, "first");
         mkdir((dir / "later").c_str(), 0700);
         xlogPrint(XLOG_LEVEL_E, XLOG_MODULE_XLOG, "f", "g", 1, "second");
-        struct stat info {};
-        if (stat((dir / "later/kmsg").c_str(), &info) == 0) return "the open was tried again";
+        if (dir.mode("later/kmsg") != 0) return "the open was tried again";
         return capture.lines().size() == 2 ? "" : "Android log lines were lost";
     });
     EXPECT_TRUE(outcome.ok()) << outcome.describe();
