@@ -3,6 +3,7 @@
 // three bits give the number of delimiter bytes that follow, the rest is the
 // text), even applies the rest as a level specification.
 #include <algorithm>
+#include <cstring>
 #include <string>
 #include <vector>
 
@@ -13,90 +14,64 @@
 
 namespace {
 
-using fuzz::expect;
-
-std::string trimmed(const std::string& s) {
-    static const std::string kSpace(" \t\n\v\f\r");
-    const size_t first = s.find_first_not_of(kSpace);
-    if (first == std::string::npos) return "";
-    return s.substr(first, s.find_last_not_of(kSpace) - first + 1);
-}
-
-// Cut at every delimiter; drop the empty pieces, except the last piece, which
-// is always kept; trim what remains.
+// Cut at every delimiter; drop the empty pieces but the last; trim the rest.
 std::vector<std::string> referenceSplit(const std::string& s, const std::string& delims) {
-    std::vector<std::string> pieces(1);
+    std::vector<std::string> pieces(1), fields;
     for (const char c : s) {
-        if (delims.find(c) != std::string::npos) {
-            pieces.emplace_back();
-        } else {
-            pieces.back() += c;
+        if (delims.find(c) != std::string::npos) pieces.emplace_back();
+        if (delims.find(c) == std::string::npos) pieces.back() += c;
+    }
+    for (size_t i = 0; i < pieces.size(); ++i) {
+        const size_t first = pieces[i].find_first_not_of(" \t\n\v\f\r");
+        const size_t last = pieces[i].find_last_not_of(" \t\n\v\f\r");
+        if (!pieces[i].empty() || i + 1 == pieces.size()) {
+            fields.push_back(
+                first == std::string::npos ? "" : pieces[i].substr(first, last - first + 1));
         }
     }
-    std::vector<std::string> fields;
-    for (size_t i = 0; i < pieces.size(); ++i)
-        if (!pieces[i].empty() || i + 1 == pieces.size()) fields.push_back(trimmed(pieces[i]));
     return fields;
 }
 
-const char* const kTags[] = {
-#define FUZZ_TAG(tag) #tag,
-    XLOG_MODULES(FUZZ_TAG)
-#undef FUZZ_TAG
-};
-static_assert(sizeof(kTags) / sizeof(kTags[0]) == XLOG_NUM_MODULES, "one tag per module");
-
 // Tokens at blanks, parts at colons; a token applies when it has two parts
 // and the level part starts with one of E W I D V; the first that does not
-// stops the rest with XERR_INVAL.
+// stops the rest with XERR_INVAL. The tags are the library's own.
 xerr_t referenceLevels(const std::string& spec, int* levels) {
-    static const std::string kLetters("EWIDV");
+    static const char kLetters[] = "EWIDV";
     for (const std::string& token : referenceSplit(spec, " ")) {
         const std::vector<std::string> parts = referenceSplit(token, ":");
-        if (parts.size() != 2 || parts[1].empty()) return XERR_INVAL;
-        const size_t level = kLetters.find(parts[1][0]);
-        if (level == std::string::npos) return XERR_INVAL;
-        for (int m = 0; m < XLOG_NUM_MODULES; ++m)
-            if (parts[0] == "*" || parts[0] == kTags[m]) levels[m] = int(level);
+        if (parts.size() != 2 || parts[1].empty() || parts[1][0] == '\0') return XERR_INVAL;
+        const char* letter = std::strchr(kLetters, parts[1][0]);
+        if (letter == nullptr) return XERR_INVAL;
+        for (int m = 0; m < XLOG_NUM_MODULES; ++m) {
+            if (parts[0] == "*" || parts[0] == g_xlog->modules[m].tag)
+                levels[m] = letter - kLetters;
+        }
     }
     return XERR_SUCCESS;
-}
-
-void fuzzSplit(const uint8_t* data, size_t size) {
-    const size_t n = size == 0 ? 0 : std::min<size_t>(data[0] & 7, size - 1);
-    const std::string delims(reinterpret_cast<const char*>(data) + (size ? 1 : 0), n);
-    const size_t start = (size ? 1 : 0) + n;
-    const std::string text(reinterpret_cast<const char*>(data) + start, size - start);
-    expect(xstrSplit(text, delims) == referenceSplit(text, delims), "xstrSplit follows its rules");
-}
-
-void fuzzLevels(const uint8_t* data, size_t size) {
-    // A known, uneven start, so that every change shows.
-    int want[XLOG_NUM_MODULES];
-    for (int m = 0; m < XLOG_NUM_MODULES; ++m) g_xlog->modules[m].level = want[m] = m % 5;
-    const std::string spec(reinterpret_cast<const char*>(data), size);
-    const xerr_t wantResult = referenceLevels(spec, want);
-    expect(xlogSetLevels(spec) == wantResult, "xlogSetLevels answers as the rules say");
-    for (int m = 0; m < XLOG_NUM_MODULES; ++m)
-        expect(g_xlog->modules[m].level == want[m], "the levels are the ones the rules set");
 }
 
 }  // namespace
 
 extern "C" int LLVMFuzzerInitialize(int*, char***) {
-    // The default start-up fills the level letters and the module tags; then
-    // every line is formatted but goes nowhere.
-    xlogLibInit(nullptr, "", "");
-    fuzz::installFormattingLogger();
+    xlogLibInit(nullptr, "", "");     // fills the level letters and the module tags
+    fuzz::installFormattingLogger();  // lines are formatted, then dropped
     return 0;
 }
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
-    if (size == 0) return 0;
+    if (size < 2) return 0;
+    const std::string input(reinterpret_cast<const char*>(data) + 1, size - 1);
     if (data[0] & 1) {
-        fuzzSplit(data + 1, size - 1);
-    } else {
-        fuzzLevels(data + 1, size - 1);
+        const size_t n = std::min<size_t>(input[0] & 7, input.size() - 1);
+        const std::string delims = input.substr(1, n), text = input.substr(1 + n);
+        fuzz::expect(xstrSplit(text, delims) == referenceSplit(text, delims), "xstrSplit's rules");
+        return 0;
     }
+    int want[XLOG_NUM_MODULES];  // a known, uneven start, so that every change shows
+    for (int m = 0; m < XLOG_NUM_MODULES; ++m) g_xlog->modules[m].level = want[m] = m % 5;
+    fuzz::expect(xlogSetLevels(input) == referenceLevels(input, want), "xlogSetLevels' result");
+    fuzz::expect(std::equal(want, want + XLOG_NUM_MODULES, g_xlog->modules,
+                            [](int level, const XlogModule& m) { return level == m.level; }),
+                 "the levels the rules set");
     return 0;
 }

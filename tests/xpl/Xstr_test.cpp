@@ -1,119 +1,136 @@
+// The string helpers, one table per family. Folding is checked at the edges
+// of both letter ranges ('@' 'A' 'Z' '[' and '`' 'a' 'z' '{').
 #include "xpl/Xstr.h"
 
 #include <gtest/gtest.h>
 
-#include <cstring>
+#include <cstdio>
 #include <string>
 #include <vector>
 
+#include "xpl/Xmem.h"
+
 namespace {
 
-using Fields = std::vector<std::string>;
-
-TEST(XstrIcmp, WhenCaseDiffers_ComparesFoldedLetters) {
-    EXPECT_LT(xstr_icmp("abc", "ABD"), 0) << "c sorts before d whatever the case";
-    EXPECT_EQ(xstr_icmp("ABC", "abc"), 0) << "only the case differs";
-    EXPECT_LT(xstr_icmp("a", "ab"), 0) << "the terminator meets the b";
-    EXPECT_GT(xstr_icmp("ab", "a"), 0);
-    EXPECT_EQ(xstr_nicmp("abcX", "ABCy", 3), 0) << "only the first three characters count";
-    EXPECT_NE(xstr_nicmp("abcX", "ABCy", 4), 0);
-    EXPECT_EQ(xstr_nicmp("x", "y", 0), 0) << "a count of zero compares nothing";
-    EXPECT_EQ(xstr_nicmp("ab", "AB", 10), 0) << "stops where both strings end";
-}
-
-TEST(XstrIcmp, WhenBytesAreAboveAscii_OrdersThemBeforeAscii) {
-    // Bytes 0x80-0xFF compare as negative chars, unchanged by folding.
-    EXPECT_LT(xstr_icmp("\xC3\xA9", "a"), 0) << "0xC3 is a negative char";
-    EXPECT_LT(xstr_icmp("\xFF", ""), 0) << "a high byte orders before the terminator";
-    EXPECT_EQ(xstr_icmp("\xC9", "\xC9"), 0);
-    EXPECT_NE(xstr_icmp("\xC9", "\xE9"), 0)
-        << "Latin-1 capital and small E acute are not folded together";
-    EXPECT_EQ(xstr_icmp("\xC9", "\xE9"),
-              static_cast<signed char>('\xC9') - static_cast<signed char>('\xE9'))
-        << "the result is the difference of the signed bytes";
-    EXPECT_LT(xstr_icmp("[", "A"), 0) << "letters fold to lower case, so 'A' meets '[' as 'a'";
-}
-
-TEST(XstrPrintf, WhenFormatted_HoldsTheWholeOutput) {
-    EXPECT_EQ(xstrPrintf("%d-%s", 42, "x"), "42-x");
-    EXPECT_EQ(xstrPrintf("%s", ""), "");
-    std::string longText(5000, 'q');
-    std::string out = xstrPrintf("<%s>", longText.c_str());
-    EXPECT_EQ(out.size(), 5002u) << "no fixed buffer limits the output";
-    EXPECT_EQ(out, "<" + longText + ">");
-}
-
-// Regression: an encoding error made the first pass report -1, which was
-// taken as a length and turned into a huge allocation.
-TEST(XstrPrintf, WhenEncodingFails_ReturnsEmpty) {
-    const wchar_t notInCLocale[] = {0xE9, 0};
-    ASSERT_LT(std::snprintf(nullptr, 0, "%ls", notInCLocale), 0)
-        << "precondition: the C locale cannot encode U+00E9";
-    EXPECT_EQ(xstrPrintf("%ls", notInCLocale), "") << "an encoding error yields the empty string";
-}
-
-TEST(XstrTrim, RemovesPosixWhitespaceAtBothEnds) {
-    EXPECT_EQ(xstrTrim(" \t a b\r\n"), "a b");
-    EXPECT_EQ(xstrTrim("\v\f x \v\f"), "x");
-    EXPECT_EQ(xstrTrim(" \t\n"), "");
-    EXPECT_EQ(xstrTrim(""), "");
-    EXPECT_EQ(xstrTrim("\xA0x\xA0"), "\xA0x\xA0") << "a non-breaking space byte is not white space";
-}
-
-TEST(XstrCase, ConvertsAsciiLettersOnly) {
-    EXPECT_EQ(xstrToLower("AbC-1\xC9"), "abc-1\xC9");
-    EXPECT_EQ(xstrToUpper("aBc-1\xE9"), "ABC-1\xE9");
-    EXPECT_TRUE(xstrEqualsIgnoreCase("Hello", "hELLO"));
-    EXPECT_FALSE(xstrEqualsIgnoreCase("Hello", "Hell"));
-    EXPECT_TRUE(xstrEqualsIgnoreCase(std::string("ab\0x", 4), std::string("AB\0y", 4)))
-        << "comparison ends at an embedded NUL";
-}
-
-TEST(XstrAffixes, MatchPrefixesAndSuffixes) {
-    EXPECT_FALSE(xstrStartsWith("ab", "abc")) << "a prefix longer than the string";
-    EXPECT_TRUE(xstrStartsWith("abc", "ab"));
-    EXPECT_TRUE(xstrStartsWith("abc", ""));
-    EXPECT_TRUE(xstrStartsWithIgnoreCase("ABC", "ab"));
-    EXPECT_FALSE(xstrStartsWithIgnoreCase("AB", "abc"));
-
-    EXPECT_TRUE(xstrEndsWith("abc", ""));
-    EXPECT_TRUE(xstrEndsWith("abc", "bc"));
-    EXPECT_FALSE(xstrEndsWith("bc", "abc")) << "a suffix longer than the string";
-    EXPECT_FALSE(xstrEndsWith("abc", "bx"));
-    EXPECT_TRUE(xstrEndsWithIgnoreCase("fileName.TXT", ".txt"));
-    EXPECT_FALSE(xstrEndsWithIgnoreCase("txt", ".txt"));
-}
-
-TEST(XstrContains, SearchesTheWholeStoredText) {
-    EXPECT_TRUE(xstrContainsIgnoreCase("Hello", "LL"));
-    EXPECT_FALSE(xstrContains("Hello", "LL"));
-    EXPECT_TRUE(xstrContains("abc", ""));
-    EXPECT_TRUE(xstrContains(std::string("a\0bc", 4), "bc")) << "an embedded NUL does not end it";
-}
-
-TEST(XstrSplit, WhenDelimitersVary_DropsEmptyFieldsButKeepsTheLast) {
-    struct Case {
-        const char* s;
-        const char* delims;
-        Fields expected;
+TEST(Xstr, CaseInsensitiveCompare_FoldsAsciiLettersOnly) {
+    const struct {
+        const char *name, *a, *b;
+        int count;  // below 0: xstr_icmp, else xstr_nicmp over this many
+        int sign;
+    } rows[] = {
+        {"A and Z fold", "AZ", "az", -1, 0},
+        {"@ and ` are no letters", "@", "`", -1, -1},
+        {"[ and { are no letters", "[", "{", -1, -1},
+        {"a letter meets [ as lower case", "[", "A", -1, -1},
+        {"c before d whatever the case", "abc", "ABD", -1, -1},
+        {"the terminator meets b", "a", "ab", -1, -1},
+        {"the longer after", "ab", "a", -1, 1},
+        {"a high byte is negative", "\xC3\xA9", "a", -1, -1},
+        {"Latin-1 letters do not fold", "\xC9", "\xE9", -1, -1},
+        {"count 3 stops before the difference", "abcX", "ABCy", 3, 0},
+        {"count 4 reaches it", "abcX", "ABCy", 4, -1},
+        {"count 0 compares nothing", "x", "y", 0, 0},
+        {"stops where both end", "ab", "AB", 10, 0},
     };
-    const Case cases[] = {
-        {"a,b", ",", {"a", "b"}},
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.name);
+        int result = row.count < 0 ? xstr_icmp(row.a, row.b) : xstr_nicmp(row.a, row.b, row.count);
+        EXPECT_EQ((result > 0) - (result < 0), row.sign);
+    }
+}
+
+TEST(Xstr, Predicates_CompareTextsAsTheirRulesSay) {
+    const struct {
+        const char* name;
+        bool (*test)(const std::string&, const std::string&);
+        std::string s, arg;
+        bool want;
+    } rows[] = {
+        {"equal when folded", xstrEqualsIgnoreCase, "Hello", "hELLO", true},
+        {"a prefix is not equal", xstrEqualsIgnoreCase, "Hello", "Hell", false},
+        {"equality ends at a NUL", xstrEqualsIgnoreCase, {"ab\0x", 4}, {"AB\0y", 4}, true},
+        {"a prefix", xstrStartsWith, "abc", "ab", true},
+        {"a prefix longer than the text", xstrStartsWith, "ab", "abc", false},
+        {"case counts", xstrStartsWith, "ABC", "ab", false},
+        {"a folded prefix", xstrStartsWithIgnoreCase, "ABC", "ab", true},
+        {"a folded prefix too long", xstrStartsWithIgnoreCase, "AB", "abc", false},
+        {"an empty suffix", xstrEndsWith, "abc", "", true},
+        {"the whole text", xstrEndsWith, "abc", "abc", true},
+        {"a suffix longer than the text", xstrEndsWith, "bc", "abc", false},
+        {"a folded suffix", xstrEndsWithIgnoreCase, "name.TXT", ".txt", true},
+        {"a folded suffix that differs", xstrEndsWithIgnoreCase, "name.txz", ".TXT", false},
+        {"containment counts case", xstrContains, "Hello", "LL", false},
+        {"the search goes past a NUL", xstrContains, {"a\0bc", 4}, "bc", true},
+        {"folded containment", xstrContainsIgnoreCase, "Hello", "LL", true},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.name);
+        EXPECT_EQ(row.test(row.s, row.arg), row.want);
+    }
+}
+
+TEST(Xstr, TrimAndFold_ChangeOnlyWhiteSpaceAndAsciiLetters) {
+    const struct {
+        std::string (*transform)(const std::string&);
+        std::string in, want;
+    } rows[] = {
+        {xstrTrim, " \t a b\r\n", "a b"},
+        {xstrTrim, "\v\f x \v\f", "x"},
+        {xstrTrim, "\b\xA0x\x0E", "\b\xA0x\x0E"},  // neighbours of white space, a high byte
+        {xstrTrim, " \t\n", ""},
+        {xstrToLower, "@AZ[`az{\xC9", "@az[`az{\xC9"},
+        {xstrToUpper, "@AZ[`az{\xE9", "@AZ[`AZ{\xE9"},
+    };
+    for (const auto& row : rows) EXPECT_EQ(row.transform(row.in), row.want) << row.in;
+}
+
+TEST(Xstr, Split_DropsEmptyFieldsButAlwaysKeepsTheLast) {
+    const struct {
+        const char *s, *delims;
+        std::vector<std::string> want;
+    } rows[] = {
         {" a , b ", ",", {"a", "b"}},
         {"a,,b", ",", {"a", "b"}},
         {",a", ",", {"a"}},
         {"a,", ",", {"a", ""}},
         {"a, ,b", ",", {"a", "", "b"}},
         {"", ",", {""}},
-        {"*:I XMEM:D", " ", {"*:I", "XMEM:D"}},
-        {"a b,c", " ,", {"a", "b", "c"}},
-        {" x ", "", {"x"}},
         {",,,", ",", {""}},
+        {"*:I XMEM:D", " ", {"*:I", "XMEM:D"}},
+        {"a, b,c", ", ", {"a", "b", "c"}},
+        {" x ", "", {"x"}},
     };
-    for (const Case& c : cases) {
-        EXPECT_EQ(xstrSplit(c.s, c.delims), c.expected)
-            << "splitting '" << c.s << "' at '" << c.delims << "'";
+    for (const auto& row : rows) {
+        EXPECT_EQ(xstrSplit(row.s, row.delims), row.want) << row.s << " at " << row.delims;
     }
+}
+
+// Regression (last row): an encoding error made the first pass report -1,
+// which was taken as a length and turned into a huge allocation.
+TEST(Xstr, Printf_HoldsTheWholeOutput) {
+    const std::string longText(5000, 'q');
+    EXPECT_EQ(xstrPrintf("%d-%s", 42, "x"), "42-x");
+    EXPECT_EQ(xstrPrintf("%s", ""), "");
+    EXPECT_EQ(xstrPrintf("<%s>", longText.c_str()), "<" + longText + ">") << "no fixed buffer";
+    const wchar_t notInCLocale[] = {0xE9, 0};
+    ASSERT_LT(std::snprintf(nullptr, 0, "%ls", notInCLocale), 0) << "the C locale lacks U+00E9";
+    EXPECT_EQ(xstrPrintf("%ls", notInCLocale), "");
+}
+
+TEST(Xstr, ArrayHelpers_ReturnTheirTargetAndKeepTheirBounds) {
+    char* copy = xstr_dup("abc");
+    EXPECT_EQ(std::string(copy, 4), std::string("abc", 4)) << "the copy has its terminator";
+    xmem_free(copy);
+    char buf[8];
+    EXPECT_EQ(xmem_set(buf, '#', sizeof(buf)), buf);
+    EXPECT_EQ(xstr_ncpy(buf, "abcdef", 3), buf);
+    EXPECT_EQ(std::string(buf, 4), "abc#") << "strncpy adds no terminator";
+    EXPECT_EQ(xmem_cpy(buf, "pq", 2), buf);
+    EXPECT_EQ(xstr_cpy(buf + 2, "x"), buf + 2);
+    EXPECT_EQ(xstr_snprintf(buf + 3, 4, "%d", 12345), 5) << "the length it wanted";
+    EXPECT_STREQ(buf, "pqx123");
+    int a = 0, b = 0;
+    EXPECT_EQ(xstr_sscanf("7 9", "%d %d", &a, &b) * 100 + a * 10 + b, 279);
 }
 
 }  // namespace
