@@ -70,6 +70,15 @@ XPL_EXPORT extern XlogState* g_xlog;
 
 extern "C" XPL_EXPORT XlogLogger* xlogGetLogger();
 
+// What xlogGetLogger() returns, asked once per shared object or program: the
+// address never changes, so a statement need not call through the dynamic
+// linker's table for it every time. Installing a logger changes what lies
+// there, which every statement still reads afresh.
+__attribute__((visibility("hidden"))) inline XlogLogger* xlogActiveLogger() {
+    static XlogLogger* const logger = xlogGetLogger();
+    return logger;
+}
+
 XPL_EXPORT int xlogShouldLog(int module, int level);
 XPL_EXPORT void xlogPrint(int level, int module, const char* file, const char* function, int line,
                           const char* format, ...) __attribute__((format(printf, 6, 7)));
@@ -88,7 +97,7 @@ XPL_EXPORT void xlogCurrentTime(char* buf, int size);
 // `function` its signature text.
 #define XLOG_AT(module, level, file, function, ...)                                            \
     do {                                                                                       \
-        XlogLogger* xlog_logger_ = xlogGetLogger();                                            \
+        XlogLogger* xlog_logger_ = xlogActiveLogger();                                         \
         if (xlog_logger_->shouldLog((module), (level)))                                        \
             xlog_logger_->print((level), (module), (file), (function), __LINE__, __VA_ARGS__); \
     } while (0)

@@ -120,6 +120,10 @@ VMSG_DEVICE_API size_t vmsgDeviceOpenCount();
 VMSG_DEVICE_API uint64_t vmsgDeviceServedCount();
 VMSG_DEVICE_API bool vmsgDeviceWaitForServed(uint64_t count, uint32_t timeoutMs);
 
+// For timing the guest alone: while on, SEND_RECEIVE returns 0 at once; nothing
+// is read, checked or recorded, and the guest-bound buffer keeps what it held.
+VMSG_DEVICE_API void vmsgDeviceSetFastAnswers(bool on);
+
 // Called in every SEND_RECEIVE between taking the request and replying,
 // outside the model's locks, with the operation code: a test can hold an
 // exchange in flight. An empty function removes it.

@@ -122,7 +122,7 @@ bool buffersTerminated(const Args& args, std::index_sequence<I...>) {
 // One log line of the operation; `lead` is the exit line's result.
 template <uint32_t Code, typename Args, size_t... I, typename... Lead>
 void logCall(int level, int line, const Args& args, std::index_sequence<I...> seq, Lead... lead) {
-    XlogLogger* logger = xlogGetLogger();
+    XlogLogger* logger = xlogActiveLogger();
     if (!logger->shouldLog(XLOG_MODULE_HCALL, level)) return;
     const OpInfo& op = Op<Code>::info;
     bool exit = sizeof...(Lead) > 0;

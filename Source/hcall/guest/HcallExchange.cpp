@@ -1,6 +1,5 @@
 #include "hcall/guest/HcallExchange.h"
 
-#include <atomic>
 #include <mutex>
 
 #include "xpl/Xlog.h"
@@ -22,21 +21,22 @@ union LockStorage {
 };
 LockStorage gLockStorage;
 
-// Set once g_hcall is being destroyed; later exchanges are refused.
-std::atomic<bool> gClosed{false};
-
 }  // namespace
 
 std::mutex& gExchangeLock = gLockStorage.mutex;
+std::atomic<bool> gClosed{false};
 
-Exchange::Exchange() { gExchangeLock.lock(); }
-
-Exchange::~Exchange() { gExchangeLock.unlock(); }
-
-uint8_t* Exchange::requestBuffer(const char* function, size_t requestLength, size_t replyLength) {
-    VmsgGuestClient& client = g_hcall.client;
-    uint8_t* buffer = nullptr;
-    if (gClosed.load()) {
+// Why requestBuffer refused, told where there is anyone to tell. Out of line,
+// so that no operation carries these statements in its own code. It refuses
+// for one of three reasons, tested here again in its order: the connection is
+// closed because the process is exiting, the request is longer than the
+// header's 32-bit length can state, or its reply would be longer than the
+// guest-bound buffer. A request longer than the host-bound buffer is refused
+// by the client, which says so itself; a reply is only checked once the
+// client has handed out the buffer.
+uint8_t* Exchange::refuse(const char* function, size_t requestLength, size_t replyLength) {
+    const VmsgGuestClient& client = g_hcall.client;
+    if (gClosed.load(std::memory_order_relaxed)) {
         // The process is exiting; nothing to report to.
     } else if (requestLength > UINT32_MAX) {
         // Beyond what the header can state; the client's own test could not
@@ -45,21 +45,15 @@ uint8_t* Exchange::requestBuffer(const char* function, size_t requestLength, siz
                 "%s: request of %zu bytes, mMaxHostBoundSize %u", function, requestLength,
                 client.mMaxHostBoundSize);
     } else {
-        buffer = static_cast<uint8_t*>(client.getHostBoundBuffer(uint32_t(requestLength)));
-        // A reply running past the guest-bound buffer would be read from
-        // beyond the mapping.
-        if (buffer && replyLength > client.mMaxGuestBoundSize) {
-            XLOG_AT(XLOG_MODULE_HCALL, XLOG_LEVEL_E, kEncSource, function,
-                    "%s: reply of %zu bytes, mMaxGuestBoundSize %u", function, replyLength,
-                    client.mMaxGuestBoundSize);
-            buffer = nullptr;
-        }
+        // The reply is read in place, so one running past the guest-bound
+        // buffer would be read from beyond the mapping; the capacity the
+        // device stated at connect is the only bound the guest has for it
+        // (the mapping's length follows from it).
+        XLOG_AT(XLOG_MODULE_HCALL, XLOG_LEVEL_E, kEncSource, function,
+                "%s: reply of %zu bytes, mMaxGuestBoundSize %u", function, replyLength,
+                client.mMaxGuestBoundSize);
     }
-    return buffer;
-}
-
-const uint8_t* Exchange::send(uint8_t* request, uint32_t length) {
-    return static_cast<const uint8_t*>(g_hcall.client.processRequest(request, length));
+    return nullptr;
 }
 
 }  // namespace hcall

@@ -113,7 +113,7 @@ void VmsgGuestClient::disconnect() {
     mFd = -1;
 }
 
-void* VmsgGuestClient::getHostBoundBuffer(uint32_t len) {
+void* VmsgGuestClient::getHostBoundBufferDirect(uint32_t len) {
     VMSG_TRACE(kGetHostBoundBuffer, "called for %s\n", mServiceName.c_str());
     if (len > mMaxHostBoundSize) {
         VMSG_AT_LINE(XLOG_LEVEL_E, kGetHostBoundBuffer, "len %u, mMaxHostBoundSize %u", len,
@@ -129,7 +129,7 @@ void* VmsgGuestClient::getHostBoundBuffer(uint32_t len) {
     return mHostBoundBuf;
 }
 
-void* VmsgGuestClient::processRequest(void* /*request*/, uint32_t len) {
+void* VmsgGuestClient::processRequestDirect(void* /*request*/, uint32_t len) {
     VMSG_TRACE(kProcessRequest, "called for %s\n", mServiceName.c_str());
     // Refused without a line of its own, like an oversized request: the
     // caller's getHostBoundBuffer has already said why.
@@ -144,4 +144,10 @@ void* VmsgGuestClient::processRequest(void* /*request*/, uint32_t len) {
         return nullptr;
     }
     return mGuestBoundBuf;
+}
+
+void* VmsgGuestClient::getHostBoundBuffer(uint32_t len) { return getHostBoundBufferDirect(len); }
+
+void* VmsgGuestClient::processRequest(void* request, uint32_t len) {
+    return processRequestDirect(request, len);
 }

@@ -33,6 +33,11 @@ class XPL_EXPORT VmsgGuestClient {
     // waits for the reply; returns the guest-bound buffer, or null when refused
     // or failed.
     void* processRequest(void* request, uint32_t len);
+    // The same two, as the library's own host calls reach them: bound inside
+    // the library rather than through the dynamic linker's table, so an
+    // interposed definition of the two above sees outside callers only.
+    __attribute__((visibility("hidden"))) void* getHostBoundBufferDirect(uint32_t len);
+    __attribute__((visibility("hidden"))) void* processRequestDirect(void* request, uint32_t len);
 
     int32_t mFd = -1;
     // The capacities change only inside connect, which stores each with
