@@ -116,10 +116,6 @@ AllocatedBytes sanitizerAllocatedBytes() {
 #define TEST_NATIVE(type, name) \
     extern "C" JNIEXPORT type JNICALL Java_com_zelvane_server_bridgetest_TestNative_##name
 
-// Found first when the JVM looks for this library's entry point, whatever
-// else the process has loaded.
-extern "C" JNIEXPORT jint JNI_OnLoad(JavaVM*, void*) { return JNI_VERSION_1_6; }
-
 TEST_NATIVE(void, startLogCapture)(JNIEnv*, jclass) {
     if (gCapture == nullptr) gCapture = new AndroidLogCapture();
 }
@@ -241,8 +237,4 @@ TEST_NATIVE(jlong, nativeHeapInUse)(JNIEnv*, jclass) {
     if (AllocatedBytes allocated = sanitizerAllocatedBytes()) return jlong(allocated());
     const struct mallinfo2 info = mallinfo2();
     return jlong(info.uordblks + info.hblkhd);
-}
-
-TEST_NATIVE(jboolean, sanitized)(JNIEnv*, jclass) {
-    return sanitizerAllocatedBytes() != nullptr ? JNI_TRUE : JNI_FALSE;
 }

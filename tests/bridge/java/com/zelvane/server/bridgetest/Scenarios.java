@@ -2,13 +2,12 @@ package com.zelvane.server.bridgetest;
 
 import com.zelvane.server.KivHostCallService;
 import java.io.IOException;
+import java.io.UncheckedIOException;
 import java.nio.file.Files;
 import java.nio.file.Path;
 import java.util.Arrays;
 import java.util.List;
 import java.util.SplittableRandom;
-import java.util.concurrent.CompletableFuture;
-import java.util.concurrent.CountDownLatch;
 
 /**
  * Scenarios that need a process of their own, run by {@link ChildJvm}. Each
@@ -51,24 +50,21 @@ public final class Scenarios {
                 value == null ? "other.key=1\n" : "kiv.debug.kivhostcall=" + value + "\n");
     }
 
-    /** Calls native_init on a new thread and counts the threads it started, which inherit its name. */
+    /** Calls native_init on a thread of its own and counts the other threads of its name: the workers it started. */
     static long threadsStartedByInit(KivHostCallService s, String name) throws Exception {
-        CountDownLatch counted = new CountDownLatch(1);
-        CompletableFuture<Path> caller = new CompletableFuture<>();
+        Path[] caller = new Path[1];
         Thread thread = new Thread(() -> {
             s.native_init();
             try {
-                caller.complete(Files.readSymbolicLink(Path.of("/proc/thread-self")).getFileName());
-                counted.await();
-            } catch (IOException | InterruptedException e) {
-                caller.completeExceptionally(e);
+                caller[0] = Files.readSymbolicLink(Path.of("/proc/thread-self")).getFileName();
+            } catch (IOException e) {
+                throw new UncheckedIOException(e);
             }
         }, name);
         thread.start();
-        Path self = caller.get();
-        long started;
+        thread.join();
         try (var tasks = Files.list(Path.of("/proc/self/task"))) {
-            started = tasks.filter(t -> !t.getFileName().equals(self)).filter(t -> {
+            return tasks.filter(t -> !t.getFileName().equals(caller[0])).filter(t -> {
                 try {
                     return Files.readString(t.resolve("comm")).trim().equals(name);
                 } catch (IOException e) {
@@ -76,9 +72,6 @@ public final class Scenarios {
                 }
             }).count();
         }
-        counted.countDown();
-        thread.join();
-        return started;
     }
 
     /**

@@ -7,6 +7,7 @@ import java.nio.charset.StandardCharsets;
 import java.nio.file.Files;
 import java.nio.file.Path;
 import java.util.ArrayList;
+import java.util.Arrays;
 import java.util.List;
 import java.util.Map;
 import java.util.SplittableRandom;
@@ -82,7 +83,6 @@ final class Soak {
             tagged("setUsageStatsUpdateInterval", (x, s, i) -> x.native_setUsageStatsUpdateInterval(i)),
             tagged("onVibrate", (x, s, i) -> x.native_onVibrate(20, s)),
             untagged("onConsoleModeStateChanged", (x, s, i) -> x.native_onConsoleModeStateChanged(false)));
-    static final String LAUNCH_OP = "hcallIsAppLaunchAllowedRpc";
 
     final KivHostCallService service;
     final int eventsPerRound;
@@ -196,69 +196,71 @@ final class Soak {
     }
 
     private static final Pattern TAG = Pattern.compile("([TQ])(\\d+)#(\\d+)|\\b(1\\d{9})\\b");
+    private static final String LAUNCH_OP = "hcallIsAppLaunchAllowedRpc";
+    private static final String AD_ID_OP = "hcallSetGoogleAdIdRpc";
 
-    /** Accounts for every event and query in the host's trace; the expected line counts, by the same keys as {@link #lines}. */
+    /**
+     * Accounts for every exchange in the host's trace: how many of each kind,
+     * each tagged event and query in its sender's order (so none twice) and
+     * as its sender sent it, each query's answer as the host gave it.
+     * Returns the bridge lines to expect, by the keys of {@link #lines}.
+     */
     Map<String, Long> verify(Path trace) throws IOException {
-        int[] lastEvent = new int[PRODUCERS];
-        int[] lastQuery = new int[ASKERS];
-        java.util.Arrays.fill(lastEvent, -1);
-        java.util.Arrays.fill(lastQuery, -1);
-        long[] seenTagged = new long[PRODUCERS];
-        long[] untagged = new long[KINDS.size()];
+        List<String> ops = KINDS.stream().map(Kind::op).toList();
+        // By kind, the two queries together last.
+        long[] atHost = new long[KINDS.size() + 1];
+        long[] sentCount = new long[KINDS.size() + 1];
+        // By producer, then asker: the last sequence number seen.
+        int[] last = new int[PRODUCERS + ASKERS];
+        Arrays.fill(last, -1);
         Map<String, Long> expected = new TreeMap<>();
         try (BufferedReader in = Files.newBufferedReader(trace, StandardCharsets.ISO_8859_1)) {
             for (String line; (line = in.readLine()) != null;) {
                 String call = line.split(" ", 3)[2];
                 String op = call.substring(0, call.indexOf('('));
                 String answer = call.substring(call.lastIndexOf(" -> ") + 4);
-                Matcher tag = TAG.matcher(call);
-                boolean hasTag = tag.find();
-                if (op.equals(LAUNCH_OP) || op.equals("hcallSetGoogleAdIdRpc")) {
-                    int q = Integer.parseInt(tag.group(2));
-                    int seq = Integer.parseInt(tag.group(3));
-                    if (seq <= lastQuery[q]) problem("query " + q + "#" + seq + " after #" + lastQuery[q]);
-                    lastQuery[q] = seq;
-                    int host = op.equals(LAUNCH_OP) ? (answer.equals("true") ? 1 : 0) : Integer.parseInt(answer);
-                    if (answers[q][seq] != host) problem("query " + q + "#" + seq + ": Java saw " + answers[q][seq] + ", the host " + answer);
-                    continue;
-                }
-                int kind = KINDS.stream().map(Kind::op).toList().indexOf(op);
+                boolean query = op.equals(LAUNCH_OP) || op.equals(AD_ID_OP);
+                int kind = query ? KINDS.size() : ops.indexOf(op);
                 if (kind < 0) {
                     problem("an operation the soak never sends: " + call);
-                } else if (!KINDS.get(kind).tagged) {
-                    untagged[kind]++;
-                } else if (!hasTag || "Q".equals(tag.group(1))) {
-                    problem("event without its tag: " + call);
+                    continue;
+                }
+                atHost[kind]++;
+                Matcher tag = TAG.matcher(call);
+                if (!query && !KINDS.get(kind).tagged) {
+                    // counted only
+                } else if (!tag.find() || query != (tag.group(1) != null && tag.group(1).equals("Q"))) {
+                    problem("without its tag: " + call);
                 } else {
-                    int p = tag.group(4) == null ? Integer.parseInt(tag.group(2)) : (Integer.parseInt(tag.group(4)) - INT_TAG_BASE) / MAX_SEQ;
-                    int seq = tag.group(4) == null ? Integer.parseInt(tag.group(3)) : (Integer.parseInt(tag.group(4)) - INT_TAG_BASE) % MAX_SEQ;
-                    if (seq <= lastEvent[p]) problem("T" + p + "#" + seq + " after #" + lastEvent[p] + " (twice, or out of order)");
-                    if (sent[p][seq] != kind) problem("T" + p + "#" + seq + " arrived as another kind: " + call);
-                    lastEvent[p] = seq;
-                    seenTagged[p]++;
+                    int intTag = tag.group(4) == null ? 0 : Integer.parseInt(tag.group(4)) - INT_TAG_BASE;
+                    int id = tag.group(4) != null ? intTag / MAX_SEQ : Integer.parseInt(tag.group(2)) + (query ? PRODUCERS : 0);
+                    int seq = tag.group(4) != null ? intTag % MAX_SEQ : Integer.parseInt(tag.group(3));
+                    if (seq <= last[id]) problem(call + " came after #" + last[id] + " of its sender");
+                    last[id] = seq;
+                    int javaSaw = query ? answers[id - PRODUCERS][seq] : sent[id][seq];
+                    int host = !query ? kind : op.equals(LAUNCH_OP) ? (answer.equals("true") ? 1 : 0) : Integer.parseInt(answer);
+                    if (javaSaw != host) problem(call + ": Java " + (query ? "saw " : "sent kind ") + javaSaw);
                 }
-                if (answer.equals("0")) delivered++;
-                else {
+                if (query) continue;
+                if (answer.equals("0")) {
+                    delivered++;
+                } else {
                     failed++;
-                    if (kind >= 0) expected.merge("failed " + KINDS.get(kind).method, 1L, Long::sum);
+                    expected.merge("failed " + KINDS.get(kind).method, 1L, Long::sum);
                 }
             }
         }
-        long[] untaggedSent = new long[KINDS.size()];
-        for (int p = 0; p < PRODUCERS; p++) {
-            long tagged = 0;
-            for (byte kind : sent[p]) {
-                if (kind < 0) problem("a forwarding method refused an event of producer " + p);
-                else if (KINDS.get(kind).tagged) tagged++;
-                else untaggedSent[kind]++;
-                if (kind >= 0 && KINDS.get(kind).method.equals("onVibrate")) expected.merge("vibrate called", 1L, Long::sum);
+        for (byte[] events : sent) {
+            for (byte kind : events) {
+                if (kind < 0) problem("a forwarding method refused an event");
+                else sentCount[kind]++;
             }
-            if (seenTagged[p] != tagged) problem("producer " + p + ": " + tagged + " tagged events sent, " + seenTagged[p] + " at the host");
         }
-        if (!java.util.Arrays.equals(untagged, untaggedSent))
-            problem("untagged events by kind: sent " + java.util.Arrays.toString(untaggedSent) + ", at the host " + java.util.Arrays.toString(untagged));
-        for (int q = 0; q < ASKERS; q++)
-            if (lastQuery[q] != answers[q].length - 1) problem("asker " + q + ": last query at the host " + lastQuery[q]);
+        sentCount[KINDS.size()] = (long) ASKERS * answers[0].length;
+        long vibrations = sentCount[ops.indexOf("hcallOnVibrateRpc")];
+        if (vibrations > 0) expected.put("vibrate called", vibrations);
+        if (!Arrays.equals(atHost, sentCount))
+            problem("exchanges by kind: sent " + Arrays.toString(sentCount) + ", at the host " + Arrays.toString(atHost));
         if (TestNative.overlaps() != 0) problem(TestNative.overlaps() + " exchanges overlapped");
         return expected;
     }

@@ -33,6 +33,6 @@ final class TestNative {
     /** {bytes, releases} of getStringFromJstring under a runtime that lends no bytes. */
     static native int[] convertStarved(String s);
 
+    /** Bytes the native allocator (a sanitizer's, if there is one) has handed out and not taken back. */
     static native long nativeHeapInUse();
-    static native boolean sanitized();
 }
