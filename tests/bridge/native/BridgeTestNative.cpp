@@ -192,6 +192,15 @@ TEST_NATIVE(jint, connects)(JNIEnv*, jclass) {
     return count;
 }
 
+// Loads `path` for good, so that the JVM's own unloading of it after a failed
+// JNI_OnLoad leaves it mapped: the JVM logs the library's name after it has
+// unloaded it, a read of freed memory that AddressSanitizer stops on.
+TEST_NATIVE(void, keepLoaded)(JNIEnv* env, jclass, jstring path) {
+    const char* chars = env->GetStringUTFChars(path, nullptr);
+    (void)dlopen(chars, RTLD_LAZY);
+    env->ReleaseStringUTFChars(path, chars);
+}
+
 TEST_NATIVE(void, holdUntilExit)(JNIEnv*, jclass, jint opCode) {
     vmsgDeviceSetHostHook([opCode](uint32_t code) {
         if (code != uint32_t(opCode)) return;

@@ -144,6 +144,7 @@ public final class Scenarios {
     static void noService() {
         System.load(System.getProperty("hostcall.testlib"));
         TestNative.startLogCapture();
+        TestNative.keepLoaded(System.getProperty("hostcall.lib"));
         try {
             System.load(System.getProperty("hostcall.lib"));
             result("load", "loaded");

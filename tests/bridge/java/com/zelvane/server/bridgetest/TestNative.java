@@ -26,6 +26,9 @@ final class TestNative {
     static native long served();
     static native boolean awaitServed(long count, long timeoutMs);
 
+    /** Keeps the library at `path` loaded whatever the JVM unloads. */
+    static native void keepLoaded(String path);
+
     /** Holds the host calls of opCode until the process exits, after the library's static destructors. */
     static native void holdUntilExit(int opCode);
     static native boolean awaitHeld(long timeoutMs);
