@@ -78,7 +78,9 @@ final class Bridge {
     /** The bridge's own lines from index `from` of {@link #lines} on. */
     static List<String> bridgeLines(int from) {
         List<String> all = lines();
-        return new ArrayList<>(all.subList(from, all.size()).stream().filter(l -> l.contains("|" + TAG + "|")).toList());
+        List<String> lines = new ArrayList<>(all.subList(from, all.size()));
+        lines.removeIf(l -> !l.contains("|" + TAG + "|"));
+        return lines;
     }
 
     /**

@@ -33,7 +33,7 @@ final class ChildJvm {
         this.elapsed = elapsed;
     }
 
-    /** Runs the scenario `args` with `classPath` and `env` added, and checks it ended with `exitCode` and no complaint. */
+    /** Runs the scenario `args` with `classPath` and `env` added; checks it ended with `exitCode`, uncomplaining. */
     static ChildJvm run(int exitCode, String classPath, Map<String, String> env, String... args) {
         List<String> command = new ArrayList<>(List.of(ProcessHandle.current().info().command().orElse("java"),
                 "-Xcheck:jni", "-Xmx64m", "-XX:ErrorFile=" + System.getProperty("java.io.tmpdir") + "/hs_err_%p.log"));

@@ -39,6 +39,11 @@ class MethodsTest {
         TestNative.configureHost(false, new int[] {28, AD_ID_RESULT, 14, UNINSTALL_RESULT});
     }
 
+    /** A method's name string: "jint name(JNIEnv *, jobject, parameters)". */
+    private static String jint(String name, String parameters) {
+        return "jint " + name + "(JNIEnv *, jobject" + (parameters.isEmpty() ? "" : ", " + parameters) + ")";
+    }
+
     /**
      * A forwarding method: `first` is its line before the strings are
      * converted (": called", " called" or null), `detail` its line after the
@@ -53,73 +58,76 @@ class MethodsTest {
     }
 
     /** A query: its lines are all written on the caller's thread, under the method's own name. */
-    private static Row query(String name, String detail, Supplier<Object> call, Object answer, int rval, Wire request) {
-        return new Row(name, call, answer, request.hex(),
-                List.of(debug(name + ": called"), debug(name + detail), debug(name + ": returning, rval = " + rval)));
+    private static Row query(String name, String detail, Supplier<Object> call, Object answer, Wire request) {
+        int rval = answer instanceof Boolean yes ? (yes ? 1 : 0) : (Integer) answer;
+        return new Row(name, call, answer, request.hex(), List.of(debug(name + ": called"), debug(name + detail),
+                debug(name + ": returning, rval = " + rval)));
     }
 
     private List<Row> rows() {
-        String uninstalled = "jint onAppUninstalled(JNIEnv *, jobject, jstring)";
+        String appConfig = jint("setAppConfigDbParams", "jstring, jboolean, jboolean, jstring, jboolean");
+        String installed =
+                jint("onAppInstalled", "jstring, jstring, jstring, jint, jstring, jstring, jstring, jboolean");
+        String uninstalled = jint("onAppUninstalled", "jstring");
         return List.of(
-                event("jint initInputDebuggingStatus(JNIEnv *, jobject, jboolean, jboolean)", null,
-                        ": showTouches = 1 showPointerLocation = 0", () -> s.native_initInputDebuggingStatus(true, false),
-                        Wire.op(2).bool(true).bool(false)),
-                event("jint initImeStatus(JNIEnv *, jobject, jstring)", ": called", ": imeName = " + E_ACUTE,
+                event(jint("initInputDebuggingStatus", "jboolean, jboolean"), null,
+                        ": showTouches = 1 showPointerLocation = 0",
+                        () -> s.native_initInputDebuggingStatus(true, false), Wire.op(2).bool(true).bool(false)),
+                event(jint("initImeStatus", "jstring"), ": called", ": imeName = " + E_ACUTE,
                         () -> s.native_initImeStatus(E_ACUTE), Wire.op(3).str(E_ACUTE)),
-                event("jint syncInstalledApps(JNIEnv *, jobject, jstring)", ": called", ": jsonData = [" + WITH_NUL + "]",
+                event(jint("syncInstalledApps", "jstring"), ": called", ": jsonData = [" + WITH_NUL + "]",
                         () -> s.native_syncInstalledApps("[" + WITH_NUL + "]"), Wire.op(6).str("[" + WITH_NUL + "]")),
-                event("jint onOrientationChanged(JNIEnv *, jobject, int)", null, ": orientation = 3",
+                event(jint("onOrientationChanged", "int"), null, ": orientation = 3",
                         () -> s.native_onOrientationChange(3), Wire.op(7).i32(3)),
-                event("jint onImeChanged(JNIEnv *, jobject, jstring)", ": called", ": imeName = " + BEYOND_BMP,
+                event(jint("onImeChanged", "jstring"), ": called", ": imeName = " + BEYOND_BMP,
                         () -> s.native_onImeChange(BEYOND_BMP), Wire.op(8).str(BEYOND_BMP)),
-                event("jint onTextEditModeChanged(JNIEnv *, jobject, jboolean)", null, ": isTextEditMode = 1",
+                event(jint("onTextEditModeChanged", "jboolean"), null, ": isTextEditMode = 1",
                         () -> s.native_onTextEditModeChange(true), Wire.op(9).bool(true)),
-                event("jint onActivityDisplayed(JNIEnv *, jobject, jstring, jstring)", ": called",
+                event(jint("onActivityDisplayed", "jstring, jstring"), ": called",
                         ": package = com.pkg, activity = com.pkg.Main",
                         () -> s.native_onActivityDisplayed("com.pkg", "com.pkg.Main"),
                         Wire.op(10).str("com.pkg").str("com.pkg.Main")),
-                event("jint exportFiles(JNIEnv *, jobject, jstring)", ": called", ": folder = /sdcard",
+                event(jint("exportFiles", "jstring"), ": called", ": folder = /sdcard",
                         () -> s.native_exportFiles("/sdcard"), Wire.op(15).str("/sdcard")),
-                event("jint startImportFiles(JNIEnv *, jobject)", ": called", null, s::native_startImportFiles, Wire.op(16)),
-                event("jint startExportFiles(JNIEnv *, jobject)", ": called", null, s::native_startExportFiles, Wire.op(17)),
-                event("jint launchOrx(JNIEnv *, jobject)", ": called", null, s::native_launchOrx, Wire.op(29)),
-                event("jint setClipboardText(JNIEnv *, jobject, jstring)", ": called", ": text = clip",
+                event(jint("startImportFiles", ""), ": called", null, s::native_startImportFiles, Wire.op(16)),
+                event(jint("startExportFiles", ""), ": called", null, s::native_startExportFiles, Wire.op(17)),
+                event(jint("launchOrx", ""), ": called", null, s::native_launchOrx, Wire.op(29)),
+                event(jint("setClipboardText", "jstring"), ": called", ": text = clip",
                         () -> s.native_setClipboardText("clip"), Wire.op(18).str("clip")),
-                event("jint onVolumeChanged(JNIEnv *, jobject, jboolean, jint)", null, ": mute = 1, volume = 7",
+                event(jint("onVolumeChanged", "jboolean, jint"), null, ": mute = 1, volume = 7",
                         () -> s.native_onVolumeChanged(true, 7), Wire.op(19).bool(true).i32(7)),
-                event("jint onGoogleLoginCompleted(JNIEnv *, jobject, jstring)", ": called", ": emailId = g@x",
+                event(jint("onGoogleLoginCompleted", "jstring"), ": called", ": emailId = g@x",
                         () -> s.native_onGoogleLoginCompleted("g@x"), Wire.op(20).str("g@x")),
-                event("jint onZelvaneLoginCompleted(JNIEnv *, jobject, jstring)", ": called", ": emailId = z@x",
+                event(jint("onZelvaneLoginCompleted", "jstring"), ": called", ": emailId = z@x",
                         () -> s.native_onZelvaneLoginCompleted("z@x"), Wire.op(21).str("z@x")),
                 // Two rows, so that any two of the three booleans differ in one of them.
-                event("jint setAppConfigDbParams(JNIEnv *, jobject, jstring, jboolean, jboolean, jstring, jboolean)", ": called",
-                        ": package = pkg, macrosDisabled = 1, showFeedbackPopup = 0, mouseCursorStyle = arrow, nativeGamepad = 0",
+                event(appConfig, ": called", ": package = pkg, macrosDisabled = 1, showFeedbackPopup = 0, "
+                                + "mouseCursorStyle = arrow, nativeGamepad = 0",
                         () -> s.native_setAppConfigDbParams("pkg", true, false, "arrow", false),
                         Wire.op(22).str("pkg").bool(true).bool(false).str("arrow").bool(false)),
-                event("jint setAppConfigDbParams(JNIEnv *, jobject, jstring, jboolean, jboolean, jstring, jboolean)", ": called",
-                        ": package = pkg, macrosDisabled = 0, showFeedbackPopup = 1, mouseCursorStyle = , nativeGamepad = 0",
+                // The style is not checked: it travels empty.
+                event(appConfig, ": called", ": package = pkg, macrosDisabled = 0, showFeedbackPopup = 1, "
+                                + "mouseCursorStyle = , nativeGamepad = 0",
                         () -> s.native_setAppConfigDbParams("pkg", false, true, "", false),
                         Wire.op(22).str("pkg").bool(false).bool(true).str("").bool(false)),
-                event("jint googleAccountListUpdated(JNIEnv *, jobject, jstring, jint)", ": called",
-                        ": emailId = a@b, action = -2", () -> s.native_googleAccountListUpdated("a@b", -2),
-                        Wire.op(23).str("a@b").i32(-2)),
+                event(jint("googleAccountListUpdated", "jstring, jint"), ": called", ": emailId = a@b, action = -2",
+                        () -> s.native_googleAccountListUpdated("a@b", -2), Wire.op(23).str("a@b").i32(-2)),
                 query("jboolean isAppLaunchAllowed(JNIEnv *, jobject, jstring)", ": pkg = p" + E_ACUTE,
-                        () -> s.native_isAppLaunchAllowed("p" + E_ACUTE), false, 0, Wire.op(24).str("p" + E_ACUTE)),
-                query("jint setGoogleAdId(JNIEnv *, jobject, jstring)", ": googleAdId = ad",
-                        () -> s.native_setGoogleAdId("ad"), AD_ID_RESULT, AD_ID_RESULT, Wire.op(28).str("ad")),
-                event("jint onCursorLocationChanged(JNIEnv *, jobject, jint, jint)", null, " called: x = -5, y = 1080",
+                        () -> s.native_isAppLaunchAllowed("p" + E_ACUTE), false, Wire.op(24).str("p" + E_ACUTE)),
+                query(jint("setGoogleAdId", "jstring"), ": googleAdId = ad", () -> s.native_setGoogleAdId("ad"),
+                        AD_ID_RESULT, Wire.op(28).str("ad")),
+                event(jint("onCursorLocationChanged", "jint, jint"), null, " called: x = -5, y = 1080",
                         () -> s.native_onCursorLocationChanged(-5, 1080), Wire.op(25).i32(-5).i32(1080)),
-                event("jint onLocaleChanged(JNIEnv *, jobject, jstring)", ": called", ": locale = fr-FR",
+                event(jint("onLocaleChanged", "jstring"), ": called", ": locale = fr-FR",
                         () -> s.native_onLocaleChanged("fr-FR"), Wire.op(12).str("fr-FR")),
-                event("jint onAppInstalled(JNIEnv *, jobject, jstring, jstring, jstring, jint, jstring, jstring, jstring, jboolean)",
-                        ": called", ": package = p, activity = p.Main, appLabel = Label, versionCode = 42, versionName = 1.0, "
-                                + "iconFileName: icon.png, source: store, isUpdate: 1",
+                event(installed, ": called", ": package = p, activity = p.Main, appLabel = Label, versionCode = 42, "
+                                + "versionName = 1.0, iconFileName: icon.png, source: store, isUpdate: 1",
                         () -> s.native_onAppInstalled("p", "p.Main", "Label", 42, "1.0", "icon.png", "store", true),
-                        Wire.op(13).str("p").str("p.Main").str("Label").i32(42).str("1.0").str("icon.png").str("store").bool(true)),
+                        Wire.op(13).str("p").str("p.Main").str("Label").i32(42).str("1.0").str("icon.png")
+                                .str("store").bool(true)),
                 // The strings it does not check travel empty.
-                event("jint onAppInstalled(JNIEnv *, jobject, jstring, jstring, jstring, jint, jstring, jstring, jstring, jboolean)",
-                        ": called", ": package = p, activity = a, appLabel = , versionCode = 0, versionName = , "
-                                + "iconFileName: , source: , isUpdate: 0",
+                event(installed, ": called", ": package = p, activity = a, appLabel = , versionCode = 0, "
+                                + "versionName = , iconFileName: , source: , isUpdate: 0",
                         () -> s.native_onAppInstalled("p", "a", "", 0, "", "", "", false),
                         Wire.op(13).str("p").str("a").str("").i32(0).str("").str("").str("").bool(false)),
                 // A failing host call, and the one task whose returning line has a blank before the comma.
@@ -127,23 +135,23 @@ class MethodsTest {
                         List.of(debug(uninstalled + ": called"), debug(uninstalled + ": pkgName = gone"),
                                 error("RPC failed for " + task(uninstalled) + ", error " + UNINSTALL_RESULT),
                                 debug(task(uninstalled) + ": returning , rval = " + UNINSTALL_RESULT))),
-                event("jint onScreenshotSaved(JNIEnv *, jobject, jstring)", ": called", ": fileName = /shot.png",
+                event(jint("onScreenshotSaved", "jstring"), ": called", ": fileName = /shot.png",
                         () -> s.native_onScreenshotSaved("/shot.png"), Wire.op(11).str("/shot.png")),
-                event("jint createDesktopShortcut(JNIEnv *, jobject, jstring)", ": called", ": pkgName = short",
+                event(jint("createDesktopShortcut", "jstring"), ": called", ": pkgName = short",
                         () -> s.native_createDesktopShortcut("short"), Wire.op(27).str("short")),
-                event("jint importFilesCompleted(JNIEnv *, jobject, jint, jstring)", ": called", ": folderString = /import",
+                event(jint("importFilesCompleted", "jint, jstring"), ": called", ": folderString = /import",
                         () -> s.native_importFilesCompleted(-13, "/import"), Wire.op(40).i32(-13).str("/import")),
-                event("jint openUrl(JNIEnv *, jobject, jstring)", ": called", ": urlString = https://x/",
+                event(jint("openUrl", "jstring"), ": called", ": urlString = https://x/",
                         () -> s.native_openUrl("https://x/"), Wire.op(26).str("https://x/")),
-                event("jint initVolume(JNIEnv *, jobject, jboolean, jint, jint)", null, ": mute = 0, volume = 5, maxVolume = 15",
+                event(jint("initVolume", "jboolean, jint, jint"), null, ": mute = 0, volume = 5, maxVolume = 15",
                         () -> s.native_initVolume(false, 5, 15), Wire.op(4).bool(false).i32(5).i32(15)),
-                event("jint onAppNotificationReceived(JNIEnv *, jobject, jstring)", ": called", ": notificationJsonString = {}",
+                event(jint("onAppNotificationReceived", "jstring"), ": called", ": notificationJsonString = {}",
                         () -> s.native_onAppNotificationReceived("{}"), Wire.op(41).str("{}")),
-                event("jint setUsageStatsUpdateInterval(JNIEnv *, jobject, int)", null, ": secs = 60",
+                event(jint("setUsageStatsUpdateInterval", "int"), null, ": secs = 60",
                         () -> s.native_setUsageStatsUpdateInterval(60), Wire.op(42).i32(60)),
-                event("jint onVibrate(JNIEnv *, jobject, jint, jstring)", " called", ": duration = 100, pkg = vib",
+                event(jint("onVibrate", "jint, jstring"), " called", ": duration = 100, pkg = vib",
                         () -> s.native_onVibrate(100, "vib"), Wire.op(30).i32(100).str("vib")),
-                event("jint onConsoleModeStateChanged(JNIEnv *, jobject, jboolean)", null, ": called consoleModeState : 0",
+                event(jint("onConsoleModeStateChanged", "jboolean"), null, ": called consoleModeState : 0",
                         () -> s.native_onConsoleModeStateChanged(false), Wire.op(43).bool(false)));
     }
 
@@ -217,8 +225,9 @@ class MethodsTest {
 
     @Test
     void UncheckedStrings_WhenNull_RaiseNullArgumentButTheEventTravelsWithEmptyStrings() {
-        assertThrows(IllegalArgumentException.class, () -> s.native_setAppConfigDbParams("pkg", false, true, null, false));
-        assertThrows(IllegalArgumentException.class, () -> s.native_onAppInstalled("p", "a", null, 3, null, null, null, true));
+        Class<IllegalArgumentException> raised = IllegalArgumentException.class;
+        assertThrows(raised, () -> s.native_setAppConfigDbParams("pkg", false, true, null, false));
+        assertThrows(raised, () -> s.native_onAppInstalled("p", "a", null, 3, null, null, null, true));
         assertEquals(List.of(Wire.op(22).str("pkg").bool(false).bool(true).str("").bool(false).hex(),
                         Wire.op(13).str("p").str("a").str("").i32(3).str("").str("").str("").bool(true).hex()),
                 Bridge.drain(s, true));

@@ -25,7 +25,7 @@ class ProcessTest {
      */
     @ParameterizedTest
     @ValueSource(strings = {"-1", " 7", "3x"})
-    void DebugSwitch_FollowsTheNumberTheFirstSuccessfulStartsAndLaterStartsRead(String onValue, @TempDir Path dir) {
+    void NativeInit_WhenRepeatedWithEachDebugValue_StartsOnceAndSwitchesOnForNonZeroNumbers(String onValue, @TempDir Path dir) {
         ChildJvm child = ChildJvm.run(Map.of("HOSTCALL_PROPERTIES_FILE", dir.resolve("p.prop").toString()),
                 "debug", onValue);
         assertEquals(List.of("first=workers 1", "[0]=workers 0 on false", "[]=workers 0 on false",
@@ -37,7 +37,8 @@ class ProcessTest {
                 debug("jint onVibrate(JNIEnv *, jobject, jint, jstring) called"),
                 error("RPC failed for " + locale + ", error -5"));
         List<String> lines = child.reported("LINE");
-        assertEquals(expected.subList(0, 3), lines.subList(0, Math.min(3, lines.size())), "entry and start lines first");
+        assertEquals(expected.subList(0, 3), lines.subList(0, Math.min(3, lines.size())),
+                "entry and start lines first");
         assertEquals(expected.stream().sorted().toList(), lines.stream().sorted().toList(),
                 "with the switch off only these lines are written");
     }

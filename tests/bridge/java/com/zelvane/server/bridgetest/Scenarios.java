@@ -104,9 +104,8 @@ public final class Scenarios {
             result("[" + values[i] + "]", "workers " + workers + " on " + Bridge.bridgeLines(mark).contains(detail));
         }
         result("connects", TestNative.connects());
-        result("alreadyStarted", Bridge.lines().stream()
-                .filter(l -> l.equals("4|" + Bridge.TAG + "|void native_init(JNIEnv *, jobject): service already started"))
-                .count());
+        String alreadyStarted = "4|" + Bridge.TAG + "|void native_init(JNIEnv *, jobject): service already started";
+        result("alreadyStarted", Bridge.lines().stream().filter(alreadyStarted::equals).count());
     }
 
     /** Events and queries before native_init, a start that cannot open the device, and a second start that can. */

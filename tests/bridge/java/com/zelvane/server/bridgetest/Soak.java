@@ -43,12 +43,12 @@ final class Soak {
     record Kind(String op, String method, boolean tagged, Send send) {}
 
     static Kind tagged(String method, Send send) {
-        return new Kind("hcall" + Character.toUpperCase(method.charAt(0)) + method.substring(1) + "Rpc", method, true, send);
+        String op = "hcall" + Character.toUpperCase(method.charAt(0)) + method.substring(1) + "Rpc";
+        return new Kind(op, method, true, send);
     }
 
     static Kind untagged(String method, Send send) {
-        Kind k = tagged(method, send);
-        return new Kind(k.op, method, false, send);
+        return new Kind(tagged(method, send).op, method, false, send);
     }
 
     static final List<Kind> KINDS = List.of(
@@ -71,7 +71,8 @@ final class Soak {
             tagged("googleAccountListUpdated", (x, s, i) -> x.native_googleAccountListUpdated(s, 2)),
             tagged("onCursorLocationChanged", (x, s, i) -> x.native_onCursorLocationChanged(i, 17)),
             tagged("onLocaleChanged", (x, s, i) -> x.native_onLocaleChanged(s)),
-            tagged("onAppInstalled", (x, s, i) -> x.native_onAppInstalled(s, "Main", "Label \u00e9", 3, "1.0", "", "store", false)),
+            tagged("onAppInstalled",
+                    (x, s, i) -> x.native_onAppInstalled(s, "Main", "Label \u00e9", 3, "1.0", "", "store", false)),
             tagged("onAppUninstalled", (x, s, i) -> x.native_onAppUninstalled(s)),
             tagged("onScreenshotSaved", (x, s, i) -> x.native_onScreenshotSaved(s + ".png")),
             tagged("createDesktopShortcut", (x, s, i) -> x.native_createDesktopShortcut(s)),
@@ -79,7 +80,8 @@ final class Soak {
                     (x, s, i) -> x.native_importFilesCompleted(0, s)),
             tagged("openUrl", (x, s, i) -> x.native_openUrl("https://example.com/" + s)),
             tagged("initVolume", (x, s, i) -> x.native_initVolume(true, i, 15)),
-            tagged("onAppNotificationReceived", (x, s, i) -> x.native_onAppNotificationReceived("{\"id\":\"" + s + "\"}")),
+            tagged("onAppNotificationReceived",
+                    (x, s, i) -> x.native_onAppNotificationReceived("{\"id\":\"" + s + "\"}")),
             tagged("setUsageStatsUpdateInterval", (x, s, i) -> x.native_setUsageStatsUpdateInterval(i)),
             tagged("onVibrate", (x, s, i) -> x.native_onVibrate(20, s)),
             untagged("onConsoleModeStateChanged", (x, s, i) -> x.native_onConsoleModeStateChanged(false)));
@@ -96,6 +98,9 @@ final class Soak {
     final Map<String, Long> lines = new TreeMap<>();
     long delivered;
     long failed;
+    /** Resident size and native heap in use after warm-up and at the end, in bytes. */
+    long[] afterWarmUp;
+    long[] atEnd;
 
     Soak(KivHostCallService service, int events) {
         this.service = service;
@@ -105,6 +110,7 @@ final class Soak {
         answers = new int[ASKERS][ROUNDS * queriesPerRound];
     }
 
+    /** The tag, and now and then some length. */
     static String text(SplittableRandom random, String tag) {
         return random.nextInt(4) == 0 ? tag + "~" + "x".repeat(random.nextInt(200)) : tag;
     }
@@ -112,7 +118,8 @@ final class Soak {
     /** Sends one random event as `producer`'s number `seq`; returns its kind index, or -1 when it was refused. */
     static int send(KivHostCallService s, SplittableRandom random, int producer, int seq) {
         int kind = random.nextInt(KINDS.size());
-        int result = KINDS.get(kind).send.call(s, text(random, "T" + producer + "#" + seq), INT_TAG_BASE + producer * MAX_SEQ + seq);
+        String tag = text(random, "T" + producer + "#" + seq);
+        int result = KINDS.get(kind).send.call(s, tag, INT_TAG_BASE + producer * MAX_SEQ + seq);
         return result == 0 ? kind : -1;
     }
 
@@ -121,10 +128,6 @@ final class Soak {
         String tag = text(random, "Q" + asker + "#" + seq);
         return (seq + asker) % 2 == 0 ? (s.native_isAppLaunchAllowed(tag) ? 1 : 0) : s.native_setGoogleAdId(tag);
     }
-
-    /** Resident size and native heap in use after warm-up and at the end, in bytes. */
-    long[] afterWarmUp;
-    long[] atEnd;
 
     /** The least of a few samples: the JVM borrows native memory for moments, a leak stays. */
     static long[] memory() throws IOException, InterruptedException {
@@ -166,7 +169,7 @@ final class Soak {
             await(barrier);
             await(barrier);
             if (!TestNative.awaitServed((r + 1) * perRound, Bridge.WAIT.toMillis()))
-                throw new AssertionError(TestNative.served() + " exchanges at the host after round " + r + ": events were lost");
+                throw new AssertionError(TestNative.served() + " exchanges after round " + r + ": events were lost");
             countLines();
             if (r == ROUNDS / 4) afterWarmUp = memory();
         }
@@ -183,15 +186,19 @@ final class Soak {
     }
 
     private static final Pattern FAILURE =
-            Pattern.compile("6\\|" + Bridge.TAG + "\\|RPC failed for auto (\\w+)\\(.*" + Pattern.quote(Bridge.TASK_SUFFIX) + ", error 5");
+            Pattern.compile(Pattern.quote(Bridge.error("RPC failed for auto ")) + "(\\w+)\\(.*"
+                    + Pattern.quote(Bridge.TASK_SUFFIX) + ", error 5");
     private static final String VIBRATE = Bridge.debug("jint onVibrate(JNIEnv *, jobject, jint, jstring) called");
 
     /** Counts the bridge's lines logged since the last count; the capture forgets them. */
     void countLines() {
         for (String line : TestNative.takeLogLines()) {
-            if (!line.contains("|" + Bridge.TAG + "|") || line.contains("JNI_OnLoad(") || line.contains("native_init(")) continue;
+            // The start-up lines come once, before the first round.
+            boolean startUp = line.contains("JNI_OnLoad(") || line.contains("native_init(");
+            if (!line.contains("|" + Bridge.TAG + "|") || startUp) continue;
             Matcher m = FAILURE.matcher(line);
-            lines.merge(m.matches() ? "failed " + m.group(1) : line.equals(VIBRATE) ? "vibrate called" : line, 1L, Long::sum);
+            String key = m.matches() ? "failed " + m.group(1) : line.equals(VIBRATE) ? "vibrate called" : line;
+            lines.merge(key, 1L, Long::sum);
         }
     }
 
@@ -233,12 +240,14 @@ final class Soak {
                     problem("without its tag: " + call);
                 } else {
                     int intTag = tag.group(4) == null ? 0 : Integer.parseInt(tag.group(4)) - INT_TAG_BASE;
-                    int id = tag.group(4) != null ? intTag / MAX_SEQ : Integer.parseInt(tag.group(2)) + (query ? PRODUCERS : 0);
+                    int id = tag.group(4) != null ? intTag / MAX_SEQ
+                                                  : Integer.parseInt(tag.group(2)) + (query ? PRODUCERS : 0);
                     int seq = tag.group(4) != null ? intTag % MAX_SEQ : Integer.parseInt(tag.group(3));
                     if (seq <= last[id]) problem(call + " came after #" + last[id] + " of its sender");
                     last[id] = seq;
                     int javaSaw = query ? answers[id - PRODUCERS][seq] : sent[id][seq];
-                    int host = !query ? kind : op.equals(LAUNCH_OP) ? (answer.equals("true") ? 1 : 0) : Integer.parseInt(answer);
+                    int host = !query ? kind
+                            : op.equals(LAUNCH_OP) ? (answer.equals("true") ? 1 : 0) : Integer.parseInt(answer);
                     if (javaSaw != host) problem(call + ": Java " + (query ? "saw " : "sent kind ") + javaSaw);
                 }
                 if (query) continue;
@@ -260,7 +269,7 @@ final class Soak {
         long vibrations = sentCount[ops.indexOf("hcallOnVibrateRpc")];
         if (vibrations > 0) expected.put("vibrate called", vibrations);
         if (!Arrays.equals(atHost, sentCount))
-            problem("exchanges by kind: sent " + Arrays.toString(sentCount) + ", at the host " + Arrays.toString(atHost));
+            problem("by kind: sent " + Arrays.toString(sentCount) + ", at the host " + Arrays.toString(atHost));
         if (TestNative.overlaps() != 0) problem(TestNative.overlaps() + " exchanges overlapped");
         return expected;
     }

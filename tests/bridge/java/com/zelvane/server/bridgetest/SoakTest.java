@@ -54,17 +54,17 @@ class SoakTest {
                     + soak.delivered + " delivered, " + soak.failed + " failed; resident and native heap after warm-up "
                     + Arrays.toString(soak.afterWarmUp) + ", at the end " + Arrays.toString(soak.atEnd);
             System.out.println(summary);
-            assertEquals(List.of(), soak.problems, "every event once, in order; every answer as the host gave it: " + summary);
-            assertTrue(soak.failed > 0 && soak.delivered > soak.failed, "the host failed some but not most: " + summary);
+            assertEquals(List.of(), soak.problems, "every event once, in order; answers as the host's: " + summary);
+            assertTrue(soak.failed > 0 && soak.delivered > soak.failed, "the host failed some, not most: " + summary);
             // The last tasks may still be logging when the host has served them.
             Bridge.await("a failure line for each failed event and a first line for each vibration", () -> {
                 soak.countLines();
                 return soak.lines.equals(expectedLines);
             });
-            assertTrue(soak.atEnd[1] - soak.afterWarmUp[1] < NATIVE_HEAP_MARGIN, "the native heap stays flat: " + summary);
+            assertTrue(soak.atEnd[1] - soak.afterWarmUp[1] < NATIVE_HEAP_MARGIN, "the native heap is flat: " + summary);
             // A sanitizer's quarantine and shadow grow the resident size with every allocation, leak or not.
             if (!System.getenv().getOrDefault("LD_PRELOAD", "").contains("asan"))
-                assertTrue(soak.atEnd[0] - soak.afterWarmUp[0] < RESIDENT_MARGIN, "the resident size stays flat: " + summary);
+                assertTrue(soak.atEnd[0] - soak.afterWarmUp[0] < RESIDENT_MARGIN, "resident size is flat: " + summary);
         } finally {
             Files.deleteIfExists(trace);
         }
@@ -83,8 +83,9 @@ class SoakTest {
                 String how = List.of("exit", "end", "throw").get(i % 3);
                 String seed = Long.toString(base + i);
                 outcomes.add(pair.submit(() -> {
-                    ChildJvm child = ChildJvm.run(ENDINGS.get(how), ChildJvm.CLASS_PATH, Map.of(), "soak-exit", how, seed);
-                    assertEquals(1, child.reported("RESULT").size(), how + " " + seed + " reached its end:\n" + child.output);
+                    ChildJvm child =
+                            ChildJvm.run(ENDINGS.get(how), ChildJvm.CLASS_PATH, Map.of(), "soak-exit", how, seed);
+                    assertEquals(1, child.reported("RESULT").size(), seed + " reached its end:\n" + child.output);
                     return seed + " " + child.reported("RESULT").get(0) + " in " + child.elapsed.toMillis() + " ms";
                 }));
             }
