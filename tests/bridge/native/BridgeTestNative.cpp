@@ -184,14 +184,6 @@ TEST_NATIVE(jboolean, awaitServed)(JNIEnv*, jclass, jlong count, jlong timeoutMs
     return vmsgDeviceWaitForServed(uint64_t(count), uint32_t(timeoutMs)) ? JNI_TRUE : JNI_FALSE;
 }
 
-// CONNECT requests that reached the device, successful or not.
-TEST_NATIVE(jint, connects)(JNIEnv*, jclass) {
-    jint count = 0;
-    for (const VmsgDeviceEvent& event : vmsgDeviceEvents())
-        if (event.kind == VmsgDeviceEventKind::Connect) ++count;
-    return count;
-}
-
 // Loads `path` for good, so that the JVM's own unloading of it after a failed
 // JNI_OnLoad leaves it mapped: the JVM logs the library's name after it has
 // unloaded it, a read of freed memory that AddressSanitizer stops on.

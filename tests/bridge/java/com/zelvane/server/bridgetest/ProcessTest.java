@@ -30,7 +30,7 @@ class ProcessTest {
                 "debug", onValue);
         assertEquals(List.of("first=workers 1", "[0]=workers 0 on false", "[]=workers 0 on false",
                         "[abc]=workers 0 on false", "[-0]=workers 0 on false", "[" + onValue + "]=workers 0 on true",
-                        "[0]=workers 0 on true", "connects=1", "alreadyStarted=6"),
+                        "[0]=workers 0 on true", "openDevices=1", "alreadyStarted=6"),
                 child.reported("RESULT"), "one worker and one connection whatever the number of starts");
         String locale = task("jint onLocaleChanged(JNIEnv *, jobject, jstring)");
         List<String> expected = List.of(ON_LOAD, debug(INIT + ": called"), debug(INIT + ": returning, rval = 0"),
@@ -46,7 +46,7 @@ class ProcessTest {
     @Test
     void Start_WhenTheDeviceIsMissing_KeepsEventsRefusesQueriesAndDeliversOnceAStartSucceeds() {
         ChildJvm child = ChildJvm.run(Map.of("VMSG_DEVICE_FAIL", "open"), "start");
-        assertEquals(List.of("beforeInit=[0, 0, true, -1]", "afterFailedStart=[0, true, -1, 0, 0]", "openDevices=1"),
+        assertEquals(List.of("beforeInit=[0, 0, true, -1]", "afterFailedStart=[0, true, -1, 0]", "openDevices=1"),
                 child.reported("RESULT"), "events accepted, queries refused without the host, nothing sent");
         List<String> lines = child.reported("LINE");
         assertEquals(List.of(ON_LOAD, debug(INIT + ": called")), lines.subList(0, Math.min(2, lines.size())),

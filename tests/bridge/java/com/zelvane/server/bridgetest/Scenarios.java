@@ -103,7 +103,7 @@ public final class Scenarios {
             String detail = Bridge.debug("jint onOrientationChanged(JNIEnv *, jobject, int): orientation = " + i);
             result("[" + values[i] + "]", "workers " + workers + " on " + Bridge.bridgeLines(mark).contains(detail));
         }
-        result("connects", TestNative.connects());
+        result("openDevices", TestNative.openDevices());
         String alreadyStarted = "4|" + Bridge.TAG + "|void native_init(JNIEnv *, jobject): service already started";
         result("alreadyStarted", Bridge.lines().stream().filter(alreadyStarted::equals).count());
     }
@@ -115,7 +115,7 @@ public final class Scenarios {
                 s.native_isAppLaunchAllowed("x"), s.native_setGoogleAdId("y")));
         s.native_init();
         result("afterFailedStart", List.of(s.native_setClipboardText("late"), s.native_isAppLaunchAllowed("x"),
-                s.native_setGoogleAdId("y"), TestNative.requests().length, TestNative.connects()));
+                s.native_setGoogleAdId("y"), TestNative.requests().length));
         reportLines("|" + Bridge.TAG + "|", "hcallLibInitGuest");
         TestNative.setOpenErrno(0);
         s.native_init();

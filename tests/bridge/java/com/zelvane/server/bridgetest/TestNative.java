@@ -21,7 +21,6 @@ final class TestNative {
     /** Every request the host has received, as hex. */
     static native String[] requests();
     static native int overlaps();
-    static native int connects();
     static native int openDevices();
     static native long served();
     static native boolean awaitServed(long count, long timeoutMs);
