@@ -25,7 +25,8 @@ class ProcessTest {
      */
     @ParameterizedTest
     @ValueSource(strings = {"-1", " 7", "3x"})
-    void NativeInit_WhenRepeatedWithEachDebugValue_StartsOnceAndSwitchesOnForNonZeroNumbers(String onValue, @TempDir Path dir) {
+    void NativeInit_WhenRepeatedWithEachDebugValue_StartsOnceAndSwitchesOnForNonZeroNumbers(String onValue,
+            @TempDir Path dir) {
         ChildJvm child = ChildJvm.run(Map.of("HOSTCALL_PROPERTIES_FILE", dir.resolve("p.prop").toString()),
                 "debug", onValue);
         assertEquals(List.of("first=workers 1", "[0]=workers 0 on false", "[]=workers 0 on false",
