@@ -9,7 +9,9 @@ all: build
 deps:
 	@tools/install-deps.sh
 
-# Phony on purpose: always reconfigure and rebuild into build/.
+# Phony on purpose: always reconfigure and rebuild into build/: the library,
+# its tools and what the tests need. The demo and the benchmarks are built by
+# their own targets.
 build: deps
 	cmake -S . -B build $(CMAKE_FLAGS)
 	cmake --build build -j $(JOBS)
@@ -31,10 +33,12 @@ tsan: deps
 	  ctest --test-dir build-tsan --output-on-failure -j $(JOBS) -L cxx
 
 demo: build
+	cmake --build build -j $(JOBS) --target hostcall_demo
 	demo/run-demo.sh build
 
 # Figures only: nothing here passes or fails on time.
 bench: build
+	cmake --build build -j $(JOBS) --target hostcall_bench
 	bench/run-bench.sh build
 
 # The service bridge's soak and exit proof at full size (make test runs them short).

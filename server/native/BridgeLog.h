@@ -2,11 +2,13 @@
 // debug switch that the service start reads from a system property.
 #pragma once
 
-#include <android/log.h>
+// The bridge writes its own lines with ALOGD/ALOGI/ALOGE under this tag; the
+// macros read it where they expand, so it is set before log/log.h, which
+// would otherwise default it to no tag.
+#define LOG_TAG "KivHostCallService-JNI"
+#include <log/log.h>
 
 #include <atomic>
-
-constexpr const char* kBridgeLogTag = "KivHostCallService-JNI";
 
 // Set by native_init when "kiv.debug.kivhostcall" is a non-zero number and
 // never cleared. Read on every Java thread and on the worker; relaxed atomic

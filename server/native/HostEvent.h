@@ -136,9 +136,9 @@ constexpr bool detailMatches() {
 
 inline void writeFirstLine(const MethodTexts& texts) {
     if (texts.first == FirstLine::CalledAlways)
-        __android_log_print(ANDROID_LOG_DEBUG, kBridgeLogTag, "%s called", texts.name);
+        ALOGD("%s called", texts.name);
     else if (texts.first == FirstLine::Called && bridgeDebugEnabled())
-        __android_log_print(ANDROID_LOG_DEBUG, kBridgeLogTag, "%s: called", texts.name);
+        ALOGD("%s: called", texts.name);
 }
 
 template <const MethodTexts& Texts, typename... Values>
@@ -149,12 +149,7 @@ void writeDetailLine(const std::tuple<Values...>& values) {
         if (!bridgeDebugEnabled()) return;
         auto shown = std::apply(
             [](const auto&... value) { return std::tuple_cat(loggedValue(value)...); }, values);
-        std::apply(
-            [](auto... value) {
-                __android_log_print(ANDROID_LOG_DEBUG, kBridgeLogTag, Texts.detail, Texts.name,
-                                    value...);
-            },
-            shown);
+        std::apply([](auto... value) { ALOGD(Texts.detail, Texts.name, value...); }, shown);
     }
 }
 
@@ -163,16 +158,12 @@ template <const MethodTexts& Texts, auto hostCall, typename Values>
 void runTask(const Values& values) {
     xerr_t result =
         std::apply([](const auto&... value) { return hostCall(hostValue(value)...); }, values);
-    if (result != XERR_SUCCESS)
-        __android_log_print(ANDROID_LOG_ERROR, kBridgeLogTag, "RPC failed for %s, error %d",
-                            Texts.taskName, result);
+    if (result != XERR_SUCCESS) ALOGE("RPC failed for %s, error %d", Texts.taskName, result);
     if (!bridgeDebugEnabled()) return;
     if (Texts.blankBeforeComma)
-        __android_log_print(ANDROID_LOG_DEBUG, kBridgeLogTag, "%s: returning , rval = %d",
-                            Texts.taskName, result);
+        ALOGD("%s: returning , rval = %d", Texts.taskName, result);
     else
-        __android_log_print(ANDROID_LOG_DEBUG, kBridgeLogTag, "%s: returning, rval = %d",
-                            Texts.taskName, result);
+        ALOGD("%s: returning, rval = %d", Texts.taskName, result);
 }
 
 // A forwarding method: 0 once the event is queued, -1 when a required string is
@@ -214,8 +205,7 @@ Answer askHost(JNIEnv* env, jobject object, Answer whenEmpty, Required java) {
     writeDetailLine<Texts>(values);
     auto answer = hostCall(std::get<0>(values).c_str());
     if (bridgeDebugEnabled())
-        __android_log_print(ANDROID_LOG_DEBUG, kBridgeLogTag, "%s: returning, rval = %d",
-                            Texts.name, static_cast<int>(answer));
+        ALOGD("%s: returning, rval = %d", Texts.name, static_cast<int>(answer));
     return static_cast<Answer>(answer);
 }
 

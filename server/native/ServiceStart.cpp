@@ -48,16 +48,14 @@ void logConnectFailure(xerr_t err) {
 bool bringUp() {
     std::lock_guard<std::mutex> lock(gStart.mutex);
     if (gStart.workerStarted) {
-        __android_log_print(ANDROID_LOG_INFO, kBridgeLogTag, "%s: service already started",
-                            kInitName);
+        ALOGI("%s: service already started", kInitName);
         return true;
     }
     if (!gStart.supportStarted) {
         xerr_t err = xplLibInit(nullptr, std::string());
         if (err != XERR_SUCCESS) {
             (void)fprintf(stderr, "%s: xplLibInit failed. err = %d\n", kInitName, err);
-            __android_log_print(ANDROID_LOG_ERROR, kBridgeLogTag,
-                                "%s: xplLibInit failed. err = %d\n", kInitName, err);
+            ALOGE("%s: xplLibInit failed. err = %d\n", kInitName, err);
             return false;
         }
         gStart.supportStarted = true;
@@ -88,9 +86,9 @@ void readDebugSwitch() {
 }  // namespace
 
 void startService() {
-    __android_log_print(ANDROID_LOG_DEBUG, kBridgeLogTag, "%s: called", kInitName);
+    ALOGD("%s: called", kInitName);
     if (!bringUp()) return;
-    __android_log_print(ANDROID_LOG_DEBUG, kBridgeLogTag, "%s: returning, rval = %d", kInitName, 0);
+    ALOGD("%s: returning, rval = %d", kInitName, 0);
     readDebugSwitch();
 }
 

@@ -322,17 +322,15 @@ static_assert(std::size(gMethods) == 33, "native_init and the 32 event and query
 }  // namespace
 
 jint JNI_OnLoad(JavaVM* vm, void* /*reserved*/) {
-    __android_log_print(ANDROID_LOG_INFO, kBridgeLogTag, "%s called",
-                        "jint JNI_OnLoad(JavaVM *, void *)");
+    ALOGI("%s called", "jint JNI_OnLoad(JavaVM *, void *)");
     JNIEnv* env = nullptr;
     if (vm->GetEnv(reinterpret_cast<void**>(&env), JNI_VERSION_1_4) != JNI_OK) {
-        __android_log_print(ANDROID_LOG_ERROR, kBridgeLogTag, "ERROR: GetEnv failed");
+        ALOGE("ERROR: GetEnv failed");
         return -1;
     }
     if (android::AndroidRuntime::registerNativeMethods(env, kServiceClass, gMethods,
                                                        std::size(gMethods)) != 0) {
-        __android_log_print(ANDROID_LOG_ERROR, kBridgeLogTag,
-                            "ERROR: KivHostCallService native registration failed");
+        ALOGE("ERROR: KivHostCallService native registration failed");
         return -1;
     }
     return JNI_VERSION_1_4;

@@ -8,6 +8,7 @@
 
 #include <mutex>
 #include <string>
+#include <utility>
 #include <vector>
 
 struct AndroidLogLine {
@@ -38,6 +39,14 @@ class AndroidLogCapture {
         Sink& s = sink();
         std::lock_guard<std::mutex> lock(s.mutex);
         return s.lines;
+    }
+
+    // The lines so far, which the capture then forgets: a long run takes them
+    // now and then so that the capture does not grow with the run.
+    std::vector<AndroidLogLine> take() {
+        Sink& s = sink();
+        std::lock_guard<std::mutex> lock(s.mutex);
+        return std::exchange(s.lines, {});
     }
 
     // Lines whose text contains `needle`.

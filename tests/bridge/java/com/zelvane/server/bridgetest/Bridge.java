@@ -6,24 +6,27 @@ import com.zelvane.server.KivHostCallService;
 import java.time.Duration;
 import java.util.ArrayList;
 import java.util.Arrays;
+import java.util.Collections;
 import java.util.List;
 import java.util.function.BooleanSupplier;
 
 /**
- * The library loaded into this JVM the way the Android runtime loads it, with
- * the Android log captured from before JNI_OnLoad, and a way to wait for the
- * worker to have finished everything queued so far.
+ * The library loaded into this JVM as the Android runtime loads it, with the
+ * Android log captured from before JNI_OnLoad, and a way to wait until the
+ * worker has finished everything queued so far.
  */
 final class Bridge {
     /** How long the worker may take to drain what a test queued. */
-    static final Duration WORKER_TOLERANCE = Duration.ofSeconds(30);
-
+    static final Duration WAIT = Duration.ofSeconds(30);
     static final String TAG = "KivHostCallService-JNI";
-    /** The event whose delivery proves that every earlier event was delivered. */
-    static final int SENTINEL_SECS = -424242;
-    static final byte[] SENTINEL = Wire.op(42).i32(SENTINEL_SECS).bytes();
-    static final String SENTINEL_TASK =
-            "auto setUsageStatsUpdateInterval(JNIEnv *, jobject, int)::(anonymous class)::operator()() const";
+    static final String TASK_SUFFIX = "::(anonymous class)::operator()() const";
+
+    /** The event whose delivery shows that every event queued before it has run. */
+    private static final int SENTINEL_SECS = -424242;
+    private static final String SENTINEL = Wire.op(42).i32(SENTINEL_SECS).hex();
+    private static final String SENTINEL_NAME = "setUsageStatsUpdateInterval(JNIEnv *, jobject, int)";
+    private static final String SENTINEL_RETURNING =
+            "3|" + TAG + "|auto " + SENTINEL_NAME + TASK_SUFFIX + ": returning, rval = 0";
 
     private static KivHostCallService service;
 
@@ -49,63 +52,65 @@ final class Bridge {
     }
 
     static void await(String what, BooleanSupplier condition) {
-        long deadline = System.nanoTime() + WORKER_TOLERANCE.toNanos();
+        long deadline = System.nanoTime() + WAIT.toNanos();
         while (!condition.getAsBoolean()) {
             assertTrue(System.nanoTime() < deadline, "timed out waiting for " + what);
-            Thread.onSpinWait();
             Thread.yield();
         }
     }
 
-    static List<byte[]> requests() {
-        return new ArrayList<>(Arrays.asList(TestNative.requests()));
+    static String debug(String text) {
+        return "3|" + TAG + "|" + text;
     }
 
-    static List<String> logLines() {
+    static String error(String text) {
+        return "6|" + TAG + "|" + text;
+    }
+
+    /** The name a method's task logs under, from the method's name string. */
+    static String task(String name) {
+        return "auto " + name.substring(name.indexOf(' ') + 1) + TASK_SUFFIX;
+    }
+
+    static List<String> lines() {
         return new ArrayList<>(Arrays.asList(TestNative.logLines()));
     }
 
+    /** The bridge's own lines from index `from` of {@link #lines} on. */
+    static List<String> bridgeLines(int from) {
+        List<String> all = lines();
+        List<String> lines = new ArrayList<>(all.subList(from, all.size()));
+        lines.removeIf(l -> !l.contains("|" + TAG + "|"));
+        return lines;
+    }
+
     /**
-     * Queues the sentinel and waits until the host has received it, so every
-     * event queued before has run completely (host call and lines). Returns
-     * the requests before the sentinel.
+     * Queues the sentinel and waits until the host has received it (and, with
+     * debug lines on, until its task has logged). Returns the requests the
+     * host has received before it, as hex.
      */
-    static List<byte[]> drain(KivHostCallService s, boolean debugOn) {
-        int before = logLines().size();
+    static List<String> drain(KivHostCallService s, boolean debugOn) {
+        int sent = count(TestNative.requests(), SENTINEL);
+        int logged = count(TestNative.logLines(), SENTINEL_RETURNING);
         s.native_setUsageStatsUpdateInterval(SENTINEL_SECS);
-        await("the sentinel event", () -> {
-            List<byte[]> all = requests();
-            return all.stream().anyMatch(r -> Arrays.equals(r, SENTINEL));
-        });
-        if (debugOn) {
-            String returning = "3|" + TAG + "|" + SENTINEL_TASK + ": returning, rval = 0";
-            await("the sentinel's returning line", () -> {
-                List<String> lines = logLines();
-                return lines.subList(before, lines.size()).contains(returning);
-            });
-        }
-        List<byte[]> delivered = requests();
-        delivered.removeIf(r -> Arrays.equals(r, SENTINEL));
-        return delivered;
+        await("the sentinel event", () -> count(TestNative.requests(), SENTINEL) > sent);
+        if (debugOn) await("its returning line", () -> count(TestNative.logLines(), SENTINEL_RETURNING) > logged);
+        List<String> received = new ArrayList<>(Arrays.asList(TestNative.requests()));
+        received.removeAll(List.of(SENTINEL));
+        return received;
     }
 
-    /** Lines from index `from` on, without the sentinel's own. */
-    static List<String> linesSince(int from) {
-        List<String> lines = logLines();
-        List<String> since = new ArrayList<>(lines.subList(Math.min(from, lines.size()), lines.size()));
-        since.remove("3|" + TAG + "|jint setUsageStatsUpdateInterval(JNIEnv *, jobject, int): secs = " + SENTINEL_SECS);
-        for (int i = since.size() - 1; i >= 0; i--) {
-            if (since.get(i).equals("3|" + TAG + "|" + SENTINEL_TASK + ": returning, rval = 0")) {
-                since.remove(i);
-                break;
-            }
-        }
-        return since;
+    private static int count(String[] items, String item) {
+        return Collections.frequency(Arrays.asList(items), item);
     }
 
-    static List<String> hex(List<byte[]> requests) {
-        List<String> out = new ArrayList<>();
-        for (byte[] r : requests) out.add(Wire.hex(r));
-        return out;
+    /** The bridge's lines from index `from` on, less the sentinel's, after a drain. */
+    static List<String> drainedLines(int from) {
+        List<String> lines = bridgeLines(from);
+        lines.remove(debug("jint " + SENTINEL_NAME + ": secs = " + SENTINEL_SECS));
+        // The sentinel's task logs last; another task of its method may log the same text before.
+        int last = lines.lastIndexOf(SENTINEL_RETURNING);
+        if (last >= 0) lines.remove(last);
+        return lines;
     }
 }

@@ -1,8 +1,10 @@
 package com.zelvane.server.bridgetest;
 
+import static org.junit.jupiter.api.Assertions.assertEquals;
 import static org.junit.jupiter.api.Assertions.assertFalse;
 import static org.junit.jupiter.api.Assertions.assertTrue;
 
+import java.io.File;
 import java.io.IOException;
 import java.nio.charset.StandardCharsets;
 import java.nio.file.Files;
@@ -14,75 +16,69 @@ import java.util.Map;
 import java.util.concurrent.TimeUnit;
 
 /**
- * Runs one scenario of {@link Scenarios} in a JVM of its own, with the same
- * -Xcheck:jni, preloads and class path as this one plus `env`, and collects
- * what it reports.
+ * A scenario of {@link Scenarios} run in a JVM of its own, with this JVM's
+ * -Xcheck:jni, preloads and properties, and what it reported on standard
+ * output: lines "RESULT name=value", "LINE android-log-line", "REQ hex".
  */
 final class ChildJvm {
     /** Longest a scenario may take before it counts as hung. */
-    static final Duration CHILD_TOLERANCE = Duration.ofSeconds(120);
+    static final Duration TOLERANCE = Duration.ofSeconds(60);
+    static final String CLASS_PATH = System.getProperty("java.class.path");
 
-    final int exitCode;
     final String output;
     final Duration elapsed;
 
-    private ChildJvm(int exitCode, String output, Duration elapsed) {
-        this.exitCode = exitCode;
+    private ChildJvm(String output, Duration elapsed) {
         this.output = output;
         this.elapsed = elapsed;
     }
 
-    static ChildJvm run(String scenario, Map<String, String> env, String... jvmOptions) {
-        return run(Scenarios.class.getName(), System.getProperty("java.class.path"), scenario, env, jvmOptions);
-    }
-
-    /** Runs `mainClass` with `classPath` and the single argument `scenario`. */
-    static ChildJvm run(String mainClass, String classPath, String scenario, Map<String, String> env,
-            String... jvmOptions) {
-        List<String> command = new ArrayList<>();
-        command.add(ProcessHandle.current().info().command().orElse("java"));
-        command.add("-Xcheck:jni");
-        command.addAll(List.of(jvmOptions));
-        command.add("-Dhostcall.lib=" + System.getProperty("hostcall.lib"));
-        command.add("-Dhostcall.testlib=" + System.getProperty("hostcall.testlib"));
-        command.add("-Dhostcall.exitgate=" + System.getProperty("hostcall.exitgate"));
-        command.add("-cp");
-        command.add(classPath);
-        command.add(mainClass);
-        command.add(scenario);
+    /** Runs the scenario `args` with `classPath` and `env` added; checks it ended with `exitCode`, uncomplaining. */
+    static ChildJvm run(int exitCode, String classPath, Map<String, String> env, String... args) {
+        List<String> command = new ArrayList<>(List.of(ProcessHandle.current().info().command().orElse("java"),
+                "-Xcheck:jni", "-Xmx64m", "-XX:ErrorFile=" + System.getProperty("java.io.tmpdir") + "/hs_err_%p.log"));
+        for (String property : List.of("hostcall.lib", "hostcall.testlib"))
+            command.add("-D" + property + "=" + System.getProperty(property));
+        command.addAll(List.of("-cp", classPath, Scenarios.class.getName()));
+        command.addAll(List.of(args));
         try {
             Path log = Files.createTempFile("bridge-child-", ".out");
-            ProcessBuilder builder = new ProcessBuilder(command).redirectErrorStream(true)
-                    .redirectOutput(log.toFile());
+            ProcessBuilder builder = new ProcessBuilder(command).redirectErrorStream(true).redirectOutput(log.toFile());
             builder.environment().putAll(env);
             long start = System.nanoTime();
             Process process = builder.start();
-            boolean ended = process.waitFor(CHILD_TOLERANCE.toMillis(), TimeUnit.MILLISECONDS);
-            Duration elapsed = Duration.ofNanos(System.nanoTime() - start);
+            boolean ended = process.waitFor(TOLERANCE.toMillis(), TimeUnit.MILLISECONDS);
             if (!ended) process.destroyForcibly().waitFor();
-            String output = Files.readString(log, StandardCharsets.UTF_8);
-            Files.deleteIfExists(log);
-            assertTrue(ended, "scenario " + scenario + " hung:\n" + output);
-            return new ChildJvm(process.exitValue(), output, elapsed);
+            ChildJvm child = new ChildJvm(Files.readString(log, StandardCharsets.UTF_8),
+                    Duration.ofNanos(System.nanoTime() - start));
+            Files.delete(log);
+            String scenario = String.join(" ", args);
+            assertTrue(ended, scenario + " hung:\n" + child.output);
+            assertEquals(exitCode, process.exitValue(), scenario + " exit code:\n" + child.output);
+            for (String sign : List.of("WARNING in native method", "FATAL ERROR in native method", "SIGSEGV", "SIGABRT",
+                    "hs_err_pid", "AddressSanitizer", "runtime error:", "terminate called", "FAILED:"))
+                assertFalse(child.output.contains(sign), scenario + " reported " + sign + ":\n" + child.output);
+            return child;
         } catch (IOException | InterruptedException e) {
             throw new AssertionError(e);
         }
     }
 
-    /** The reported values of one kind ("LINE", "REQ", "RESULT", ...), in order. */
+    static ChildJvm run(Map<String, String> env, String... args) {
+        return run(0, CLASS_PATH, env, args);
+    }
+
+    /** The class path without the service class, so that JNI_OnLoad cannot register the methods. */
+    static String classPathWithoutService() {
+        return String.join(File.pathSeparator, List.of(CLASS_PATH.split(File.pathSeparator)).stream()
+                .filter(entry -> !entry.endsWith("kivhostcall-service.jar")).toList());
+    }
+
+    /** The reported values of one kind ("RESULT", "LINE", "REQ"), in order. */
     List<String> reported(String kind) {
         List<String> values = new ArrayList<>();
         for (String line : output.split("\n", -1))
             if (line.startsWith(kind + " ")) values.add(line.substring(kind.length() + 1));
         return values;
-    }
-
-    /** A clean run: the expected exit code and nothing the JVM or a sanitizer complained about. */
-    ChildJvm assertClean(int expectedExit) {
-        assertTrue(exitCode == expectedExit, "exit code " + exitCode + ", expected " + expectedExit + ":\n" + output);
-        for (String sign : List.of("WARNING in native method", "FATAL ERROR in native method", "SIGSEGV",
-                "SIGABRT", "hs_err_pid", "AddressSanitizer", "runtime error:", "terminate called", "FAILED:"))
-            assertFalse(output.contains(sign), "the child reported " + sign + ":\n" + output);
-        return this;
     }
 }

@@ -2,34 +2,29 @@ package com.zelvane.server.bridgetest;
 
 import com.zelvane.server.KivHostCallService;
 import java.io.IOException;
+import java.io.UncheckedIOException;
 import java.nio.file.Files;
 import java.nio.file.Path;
+import java.util.Arrays;
 import java.util.List;
+import java.util.SplittableRandom;
 
 /**
- * Scenarios that need a process of their own: the start states, the debug
- * switch, the exit. Each reports on standard output with lines "LINE <android
- * log line>", "REQ <request hex>", "RESULT <name>=<value>"; a broken
- * expectation inside the scenario prints "FAILED: ..." and exits 1.
+ * Scenarios that need a process of their own, run by {@link ChildJvm}. Each
+ * reports on standard output ("RESULT name=value", "LINE line", "REQ hex");
+ * a broken expectation inside one prints "FAILED: ..." and exits 1.
  */
 public final class Scenarios {
     private Scenarios() {}
 
     public static void main(String[] args) throws Exception {
-        String name = args[0];
-        switch (name) {
-            case "before-init": beforeInit(); break;
-            case "failed-start": failedStart(); break;
-            case "second-init": secondInit(); break;
-            case "debug-off": debugOff(); break;
-            case "debug-values": debugValues(); break;
-            case "debug-on-value": debugOnValue(System.getenv("BRIDGE_DEBUG_VALUE")); break;
-            case "null-then-strings": nullThenStrings(); break;
-            case "exit-idle": exit(false, true); break;
-            case "exit-busy": exit(true, true); break;
-            case "end-idle": exit(false, false); break;
-            case "end-busy": exit(true, false); break;
-            default: fail("no scenario " + name);
+        switch (args[0]) {
+            case "debug" -> debug(args[1]);
+            case "start" -> start();
+            case "exit-busy" -> exitBusy(args[1].equals("exit"));
+            case "no-service" -> noService();
+            case "soak-exit" -> soakExit(args[1], Long.parseLong(args[2]));
+            default -> fail("no scenario " + args[0]);
         }
         System.out.flush();
     }
@@ -40,67 +35,38 @@ public final class Scenarios {
         Runtime.getRuntime().halt(1);
     }
 
-    static void check(boolean condition, String what) {
-        if (!condition) fail(what);
-    }
-
     static void result(String name, Object value) {
         System.out.println("RESULT " + name + "=" + value);
     }
 
-    static void reportRequests(List<byte[]> requests) {
-        for (byte[] request : requests) System.out.println("REQ " + Wire.hex(request));
+    static void reportLines(String... needles) {
+        for (String line : Bridge.lines())
+            if (Arrays.stream(needles).anyMatch(line::contains)) System.out.println("LINE " + line);
     }
 
-    /** Every captured line of the bridge's tag and of the logger's HCALL module. */
-    static void reportLines() {
-        for (String line : Bridge.logLines())
-            if (line.contains("|" + Bridge.TAG + "|") || line.contains("hcallLibInitGuest")) System.out.println("LINE " + line);
-    }
-
+    /** The debug property in the file HOSTCALL_PROPERTIES_FILE names; null: not set. */
     static void writeDebugProperty(String value) throws IOException {
-        Path file = Path.of(System.getenv("HOSTCALL_PROPERTIES_FILE"));
-        Files.writeString(file, value == null ? "# nothing set\nother.key=1\n"
-                : "# debug switch\nkiv.debug.kivhostcall=" + value + "\n");
+        Files.writeString(Path.of(System.getenv("HOSTCALL_PROPERTIES_FILE")),
+                value == null ? "other.key=1\n" : "kiv.debug.kivhostcall=" + value + "\n");
     }
 
-    static void beforeInit() {
-        KivHostCallService s = Bridge.load();
-        result("locale", s.native_onLocaleChanged("en-US"));
-        result("orientation", s.native_onOrientationChange(1));
-        result("clipboard", s.native_setClipboardText("early"));
-        result("launchAllowedBeforeConnect", s.native_isAppLaunchAllowed("x"));
-        result("adIdBeforeConnect", s.native_setGoogleAdId("y"));
-        result("exchangesBeforeInit", TestNative.requests().length);
-        s.native_init();
-        reportRequests(Bridge.drain(s, true));
-    }
-
-    static void failedStart() {
-        KivHostCallService s = Bridge.load();
-        s.native_init();
-        result("locale", s.native_onLocaleChanged("en-GB"));
-        result("orientation", s.native_onOrientationChange(2));
-        result("launchAllowed", s.native_isAppLaunchAllowed("x"));
-        result("adId", s.native_setGoogleAdId("y"));
-        result("exchangesAfterFailedStart", TestNative.requests().length);
-        result("connectsAfterFailedStart", TestNative.connects());
-        reportLines();
-        // The device appears; a second native_init retries the connection and
-        // starts the worker, which delivers what waited.
-        TestNative.setOpenErrno(0);
-        s.native_init();
-        reportRequests(Bridge.drain(s, true));
-        result("openDevices", TestNative.openDevices());
-    }
-
-    /** Threads other than `except` whose name (inherited from their creator) is `name`. */
-    static long threadsNamed(String name, Path except) throws IOException {
+    /** Calls native_init on a thread of its own and counts the other threads of its name: the workers it started. */
+    static long threadsStartedByInit(KivHostCallService s, String name) throws Exception {
+        Path[] caller = new Path[1];
+        Thread thread = new Thread(() -> {
+            s.native_init();
+            try {
+                caller[0] = Files.readSymbolicLink(Path.of("/proc/thread-self")).getFileName();
+            } catch (IOException e) {
+                throw new UncheckedIOException(e);
+            }
+        }, name);
+        thread.start();
+        thread.join();
         try (var tasks = Files.list(Path.of("/proc/self/task"))) {
-            return tasks.filter(t -> {
+            return tasks.filter(t -> !t.getFileName().equals(caller[0])).filter(t -> {
                 try {
-                    return !t.getFileName().equals(except.getFileName())
-                            && Files.readString(t.resolve("comm")).trim().equals(name);
+                    return Files.readString(t.resolve("comm")).trim().equals(name);
                 } catch (IOException e) {
                     return false;  // the thread ended meanwhile
                 }
@@ -109,46 +75,16 @@ public final class Scenarios {
     }
 
     /**
-     * Calls native_init on a new thread named `threadName` and counts the
-     * threads it started, which carry its name, while it is still alive.
+     * The lines written with the debug property unset; then native_init again
+     * with values that must leave the switch off, then `onValue`, then 0,
+     * each time noting whether a detail line appears and how many threads the
+     * repeated start began.
      */
-    static long threadsStartedByInit(KivHostCallService s, String threadName) throws Exception {
-        java.util.concurrent.CountDownLatch counted = new java.util.concurrent.CountDownLatch(1);
-        java.util.concurrent.CompletableFuture<Path> caller = new java.util.concurrent.CompletableFuture<>();
-        Thread thread = new Thread(() -> {
-            s.native_init();
-            try {
-                caller.complete(Files.readSymbolicLink(Path.of("/proc/thread-self")));
-                counted.await();
-            } catch (IOException | InterruptedException e) {
-                caller.completeExceptionally(e);
-            }
-        }, threadName);
-        thread.start();
-        long started = threadsNamed(threadName, caller.get());
-        counted.countDown();
-        thread.join();
-        return started;
-    }
-
-    static void secondInit() throws Exception {
-        writeDebugProperty("0");
+    static void debug(String onValue) throws Exception {
         KivHostCallService s = Bridge.load();
-        result("workersFromFirstInit", threadsStartedByInit(s, "hcinit-first"));
-        writeDebugProperty("1");
-        result("workersFromSecondInit", threadsStartedByInit(s, "hcinit-second"));
-        result("connects", TestNative.connects());
-        result("openDevices", TestNative.openDevices());
-        result("orientation", s.native_onOrientationChange(4));
-        reportRequests(Bridge.drain(s, true));
-        reportLines();
-    }
-
-    static void debugOff() throws Exception {
-        writeDebugProperty("0");
-        KivHostCallService s = Bridge.load();
-        s.native_init();
-        TestNative.configureHost(0, true, 0, new int[] {12, -5});
+        writeDebugProperty(null);
+        TestNative.configureHost(true, new int[] {12, -5});
+        result("first", "workers " + threadsStartedByInit(s, "hc-init"));
         s.native_onLocaleChanged("de-DE");
         s.native_onVibrate(1, "v");
         s.native_onOrientationChange(1);
@@ -156,67 +92,103 @@ public final class Scenarios {
         s.native_isAppLaunchAllowed("x");
         s.native_setGoogleAdId("y");
         Bridge.drain(s, false);
-        reportLines();
+        reportLines("|" + Bridge.TAG + "|");
+        String[] values = {"0", "", "abc", "-0", onValue, "0"};
+        for (int i = 0; i < values.length; i++) {
+            writeDebugProperty(values[i]);
+            long workers = threadsStartedByInit(s, "hc-init-" + i);
+            int mark = Bridge.lines().size();
+            s.native_onOrientationChange(i);
+            Bridge.drain(s, false);
+            String detail = Bridge.debug("jint onOrientationChanged(JNIEnv *, jobject, int): orientation = " + i);
+            result("[" + values[i] + "]", "workers " + workers + " on " + Bridge.bridgeLines(mark).contains(detail));
+        }
+        result("openDevices", TestNative.openDevices());
+        String alreadyStarted = "4|" + Bridge.TAG + "|void native_init(JNIEnv *, jobject): service already started";
+        result("alreadyStarted", Bridge.lines().stream().filter(alreadyStarted::equals).count());
     }
 
-    /** A detail line appears for the orientation sent after native_init read `value`. */
-    static boolean debugLineAfterInit(KivHostCallService s, String value, int orientation) throws IOException {
-        writeDebugProperty(value);
+    /** Events and queries before native_init, a start that cannot open the device, and a second start that can. */
+    static void start() {
+        KivHostCallService s = Bridge.load();
+        result("beforeInit", List.of(s.native_onLocaleChanged("en-US"), s.native_onOrientationChange(1),
+                s.native_isAppLaunchAllowed("x"), s.native_setGoogleAdId("y")));
         s.native_init();
-        s.native_onOrientationChange(orientation);
-        Bridge.drain(s, false);
-        String detail = "3|" + Bridge.TAG + "|jint onOrientationChanged(JNIEnv *, jobject, int): orientation = "
-                + orientation;
-        return Bridge.logLines().contains(detail);
+        result("afterFailedStart", List.of(s.native_setClipboardText("late"), s.native_isAppLaunchAllowed("x"),
+                s.native_setGoogleAdId("y"), TestNative.requests().length));
+        reportLines("|" + Bridge.TAG + "|", "hcallLibInitGuest");
+        TestNative.setOpenErrno(0);
+        s.native_init();
+        for (String request : Bridge.drain(s, true)) System.out.println("REQ " + request);
+        result("openDevices", TestNative.openDevices());
     }
 
-    /** Values that leave the switch off, each read by a repeated native_init. */
-    static void debugValues() throws Exception {
-        KivHostCallService s = Bridge.load();
-        String[] off = {null, "0", "", "abc", "-0"};
-        for (int i = 0; i < off.length; i++)
-            result("on[" + off[i] + "]", debugLineAfterInit(s, off[i], 100 + i));
-    }
-
-    static void debugOnValue(String value) throws Exception {
-        KivHostCallService s = Bridge.load();
-        result("on[" + value + "]", debugLineAfterInit(s, value, 7));
-        result("stillOnAfterZero", debugLineAfterInit(s, "0", 8));
-    }
-
-    static void nullThenStrings() {
+    /**
+     * Ends the process (System.exit, or main returning) while the worker is
+     * inside a host call that the host answers only once the library's static
+     * destructors have run; the helper then reports whether the call came back.
+     */
+    static void exitBusy(boolean viaSystemExit) {
         KivHostCallService s = Bridge.started();
-        String[] outcomes = new String[3];
-        Runnable[] calls = {
-            () -> s.native_onActivityDisplayed(null, "act"),
-            () -> s.native_onAppInstalled("p", "a", null, 1, "v", "icon", "src", true),
-            () -> s.native_setAppConfigDbParams(null, true, true, "cursor", true),
-        };
-        for (int i = 0; i < calls.length; i++) {
-            try {
-                calls[i].run();
-                outcomes[i] = "returned";
-            } catch (IllegalArgumentException e) {
-                outcomes[i] = e.getMessage();
-            }
-            result("call" + i, outcomes[i]);
-        }
-        reportRequests(Bridge.drain(s, true));
-    }
-
-    static void exit(boolean busy, boolean viaSystemExit) {
-        ExitGate.load();
-        KivHostCallService s = Bridge.started();
-        s.native_onOrientationChange(1);
-        Bridge.drain(s, true);
-        if (busy) {
-            ExitGate.holdUntilExit(12);
-            s.native_onLocaleChanged("held");
-            check(ExitGate.awaitHeld(Bridge.WORKER_TOLERANCE.toMillis()), "the worker reached the host");
-            s.native_setClipboardText("queued behind the held call");
-            result("held", true);
-        }
+        TestNative.holdUntilExit(12);
+        s.native_onLocaleChanged("held");
+        if (!TestNative.awaitHeld(Bridge.WAIT.toMillis())) fail("the worker never reached the host");
+        s.native_setClipboardText("queued behind the held call");
+        result("held", true);
         System.out.flush();
-        if (viaSystemExit) System.exit(busy ? 5 : 7);
+        if (viaSystemExit) System.exit(5);
+    }
+
+    /** Runs without the service class on the class path, so JNI_OnLoad cannot register the methods. */
+    static void noService() {
+        System.load(System.getProperty("hostcall.testlib"));
+        TestNative.startLogCapture();
+        TestNative.keepLoaded(System.getProperty("hostcall.lib"));
+        try {
+            System.load(System.getProperty("hostcall.lib"));
+            result("load", "loaded");
+        } catch (UnsatisfiedLinkError e) {
+            result("load", "refused");
+        }
+        reportLines("|" + Bridge.TAG + "|");
+    }
+
+    /**
+     * Senders and askers that never stop, a native_init at a random moment (or
+     * none), and an end at a random moment: "exit" (System.exit(3)), "end"
+     * (main returns) or "throw" (main throws).
+     */
+    static void soakExit(String how, long seed) throws Exception {
+        SplittableRandom random = new SplittableRandom(seed);
+        KivHostCallService s = Bridge.load();
+        TestNative.configureSoakHost(40, 20, seed, null);
+        long initAtMs = random.nextLong(100);
+        long endAtMs = random.nextLong(400);
+        for (int t = 0; t < 5; t++) {
+            int id = t;
+            Thread thread = new Thread(() -> {
+                SplittableRandom r = new SplittableRandom(seed * 31 + id);
+                for (int seq = 0;; seq = (seq + 1) % Soak.MAX_SEQ) {
+                    if (id < 3) Soak.send(s, r, id, seq);
+                    else Soak.ask(s, r, id - 3, seq);
+                }
+            });
+            thread.setDaemon(true);
+            thread.start();
+        }
+        long started = System.nanoTime();
+        if (initAtMs < endAtMs) {
+            Thread.sleep(initAtMs);
+            s.native_init();
+        }
+        Thread.sleep(Math.max(0, endAtMs - (System.nanoTime() - started) / 1_000_000));
+        result("ending", how + " initAtMs=" + (initAtMs < endAtMs ? initAtMs : "never") + " endAtMs=" + endAtMs
+                + " served=" + TestNative.served());
+        System.out.flush();
+        switch (how) {
+            case "exit" -> System.exit(3);
+            case "throw" -> throw new IllegalStateException("the soak ends with an uncaught exception");
+            default -> { }
+        }
     }
 }

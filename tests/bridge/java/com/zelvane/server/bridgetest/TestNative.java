@@ -1,35 +1,40 @@
 package com.zelvane.server.bridgetest;
 
-/** The test-only JNI helper (libbridge_test_native.so): log capture and the device model. */
+/**
+ * libbridge_test_native.so, loaded before the service library: the Android
+ * log, the preloaded device model and the host behind it, an exit gate.
+ */
 final class TestNative {
     private TestNative() {}
 
-    static native void startLogCapture();
     /** Every captured Android log line as "priority|tag|text". */
+    static native void startLogCapture();
     static native String[] logLines();
+    /** The lines captured since the last take, which the capture then forgets. */
+    static native String[] takeLogLines();
 
-    /** Forgets exchanges and restores the host's default answers; connections stay. */
-    static native void resetDevice();
-    /** codeResults: pairs of operation code and result. */
-    static native void configureHost(int defaultResult, boolean launchAllowed, int delayUs, int[] codeResults);
+    /** A fresh host: default answers, records cleared; codeResults pairs an operation code with its result. */
+    static native void configureHost(boolean launchAllowed, int[] codeResults);
+    /** A slow host failing now and then, recording nothing but a trace line per exchange (null: no trace). */
+    static native void configureSoakHost(int jitterUs, int failurePerMille, long seed, String tracePath);
     static native void setOpenErrno(int error);
-    static native byte[][] requests();
-    static native String[] exchangeTexts();
+    /** Every request the host has received, as hex. */
+    static native String[] requests();
     static native int overlaps();
-    static native int connects();
     static native int openDevices();
+    static native long served();
+    static native boolean awaitServed(long count, long timeoutMs);
 
-    /** Holds every exchange of opCode inside the host until releaseHost. */
-    static native void holdHost(int opCode);
-    static native boolean awaitHostHeld(long timeoutMs);
-    static native void releaseHost();
+    /** Keeps the library at `path` loaded whatever the JVM unloads. */
+    static native void keepLoaded(String path);
 
-    /** Bound through the runtime stand-in by {@link #register}. */
-    static native int boundLater();
-    /** {result, 1 if an exception is left pending} of registering one method. */
-    static native int[] register(String className, String methodName, String signature);
+    /** Holds the host calls of opCode until the process exits, after the library's static destructors. */
+    static native void holdUntilExit(int opCode);
+    static native boolean awaitHeld(long timeoutMs);
 
-    static native byte[] convert(String s);
-    /** {bytes converted, releases, releases of null} under a runtime out of memory. */
+    /** {bytes, releases} of getStringFromJstring under a runtime that lends no bytes. */
     static native int[] convertStarved(String s);
+
+    /** Bytes the native allocator (a sanitizer's, if there is one) has handed out and not taken back. */
+    static native long nativeHeapInUse();
 }

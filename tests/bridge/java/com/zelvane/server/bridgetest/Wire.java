@@ -3,8 +3,9 @@ package com.zelvane.server.bridgetest;
 import java.io.ByteArrayOutputStream;
 import java.io.DataOutputStream;
 import java.io.IOException;
+import java.util.Arrays;
 
-/** Host-call requests as the host must receive them, built from Java values. */
+/** A host-call request as the host must receive it, written from Java values. */
 final class Wire {
     private final ByteArrayOutputStream fields = new ByteArrayOutputStream();
     private final int opCode;
@@ -17,17 +18,23 @@ final class Wire {
         return new Wire(opCode);
     }
 
-    /** A string field: count, then the modified UTF-8 bytes Java hands to JNI, then NUL. */
+    /** Count, then the modified UTF-8 bytes Java hands to JNI, then NUL. */
     Wire str(String value) {
-        byte[] bytes = modifiedUtf8(value);
-        i32(bytes.length + 1);
-        fields.write(bytes, 0, bytes.length);
-        fields.write(0);
-        return this;
+        try {
+            ByteArrayOutputStream utf = new ByteArrayOutputStream();
+            new DataOutputStream(utf).writeUTF(value);
+            byte[] bytes = Arrays.copyOfRange(utf.toByteArray(), 2, utf.size());
+            i32(bytes.length + 1);
+            fields.write(bytes);
+            fields.write(0);
+            return this;
+        } catch (IOException e) {
+            throw new AssertionError(e);
+        }
     }
 
     Wire i32(int value) {
-        for (int i = 0; i < 4; i++) fields.write((value >>> (8 * i)) & 0xFF);
+        for (int i = 0; i < 4; i++) fields.write(value >>> (8 * i));
         return this;
     }
 
@@ -35,28 +42,12 @@ final class Wire {
         return i32(value ? 1 : 0);
     }
 
-    byte[] bytes() {
-        byte[] body = fields.toByteArray();
-        Wire whole = new Wire(0);
-        whole.i32(opCode).i32(8 + body.length);
-        whole.fields.write(body, 0, body.length);
-        return whole.fields.toByteArray();
-    }
-
-    static byte[] modifiedUtf8(String value) {
-        try {
-            ByteArrayOutputStream out = new ByteArrayOutputStream();
-            new DataOutputStream(out).writeUTF(value);
-            byte[] withLength = out.toByteArray();
-            return java.util.Arrays.copyOfRange(withLength, 2, withLength.length);
-        } catch (IOException e) {
-            throw new AssertionError(e);
-        }
-    }
-
-    static String hex(byte[] bytes) {
+    /** Header (operation code, total length), then the fields, as hex. */
+    String hex() {
+        Wire whole = op(0).i32(opCode).i32(8 + fields.size());
         StringBuilder text = new StringBuilder();
-        for (byte b : bytes) text.append(String.format("%02x", b & 0xFF));
+        for (byte b : whole.fields.toByteArray()) text.append(String.format("%02x", b & 0xFF));
+        for (byte b : fields.toByteArray()) text.append(String.format("%02x", b & 0xFF));
         return text.toString();
     }
 }
