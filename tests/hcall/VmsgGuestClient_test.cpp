@@ -175,11 +175,13 @@ TEST_F(VmsgGuestClientTest, Disconnect_ReleasesDeviceOnceAndKeepsTheRecord) {
     EXPECT_EQ(trace[1].text, at(trace[1], "called for hcal\n"));
 }
 
-// The connection failures, one row each: the error line, and the client left
-// unconnected with no descriptor behind. The last two rows guard regressions:
-// a mapping length that wrapped in 32 bits mapped a sliver, and a host-bound
-// capacity beyond the mapping let requests run past its end; neither layout
-// reaches mmap, so neither may say that mmap failed.
+// The connection failures, one row each, on a client whose earlier connect
+// to "abcd" failed: the error line, the client left unconnected with no
+// descriptor behind, the new name kept, and the out-words of a CONNECT that
+// succeeded kept. The last two rows guard regressions: a mapping length that
+// wrapped in 32 bits mapped a sliver, and a host-bound capacity beyond the
+// mapping let requests run past its end; neither layout reaches mmap, so
+// neither may say that mmap failed.
 TEST_F(VmsgGuestClientTest, Connect_WhenAStepFails_ReportsAndStaysUnconnected) {
     const std::string refused =
         "connection ioctl failed: ret -1, errno " + std::to_string(ECONNREFUSED);
@@ -188,67 +190,56 @@ TEST_F(VmsgGuestClientTest, Connect_WhenAStepFails_ReportsAndStaysUnconnected) {
         const char* name;
         ScriptTweak tweak;
         VmsgServiceId id;
-        std::string line;  // after "<signature>: service "
+        std::string line;        // after "<signature>: service "
+        uint32_t hostBoundSize;  // what the record holds afterwards
     } rows[] = {
         {"open", [](VmsgDeviceScript& s) { s.openErrno = ENOENT; }, kHcal,
-         "hcal: open failed for /dev/kivvmsg"},
+         "hcal: open failed for /dev/kivvmsg", 0},
         {"connect", [](VmsgDeviceScript& s) { s.connectErrno = EIO; }, kHcal,
-         "hcal: connection ioctl failed: ret -1, errno 5"},
-        {"unknown service", nullptr, 0x64636261, "abcd: " + refused},
-        {"empty name", nullptr, 0x6C616300, ": " + refused},
+         "hcal: connection ioctl failed: ret -1, errno 5", 0},
+        {"unknown service", nullptr, 0x64636261, "abcd: " + refused, 0},
+        {"empty name", nullptr, 0x6C616300, ": " + refused, 0},
         {"mmap",
          [](VmsgDeviceScript& s) {
              s.guestBoundOffset = s.guestBoundCapacity = 4096;
              s.mmapFails = true;
          },
-         kHcal, "hcal: mmap() failed: size 8192, errno " + std::to_string(EPERM)},
+         kHcal, "hcal: mmap() failed: size 8192, errno " + std::to_string(EPERM), 4096},
         {"wrapping length",
          [](VmsgDeviceScript& s) {
              s.guestBoundOffset = 0xFFFFF000;
              s.guestBoundCapacity = 0x2000;
          },
-         kHcal, layout + "4096, mMaxGuestBoundSize 8192, mGuestBoundOffset 4294963200"},
+         kHcal, layout + "4096, mMaxGuestBoundSize 8192, mGuestBoundOffset 4294963200", 4096},
         {"host-bound beyond mapping",
          [](VmsgDeviceScript& s) {
              s.hostBoundCapacity = 65536;
              s.guestBoundOffset = s.guestBoundCapacity = 256;
          },
-         kHcal, layout + "65536, mMaxGuestBoundSize 256, mGuestBoundOffset 256"},
+         kHcal, layout + "65536, mMaxGuestBoundSize 256, mGuestBoundOffset 256", 65536},
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.name);
-        VmsgGuestClient fresh;
+        VmsgGuestClient c;
+        vmsgDeviceReset();
+        EXPECT_FALSE(c.connect(0x64636261));
         VmsgDeviceScript script;
         script.hostBoundCapacity = 4096;
         if (row.tweak) row.tweak(script);
-        vmsgDeviceReset();
         vmsgDeviceConfigure(script);
         log.clear();
 
-        EXPECT_FALSE(fresh.connect(row.id));
-        EXPECT_EQ(fresh.mFd, -1);
+        EXPECT_FALSE(c.connect(row.id));
+        EXPECT_EQ(c.mFd, -1);
         EXPECT_EQ(vmsgDeviceOpenCount(), 0u) << "the device is closed again";
-        const std::vector<LoggedLine> errors = lines(XLOG_LEVEL_E);
+        EXPECT_EQ(c.mServiceName, row.line.substr(0, row.line.find(':')));
+        EXPECT_EQ(c.mMaxHostBoundSize, row.hostBoundSize);
+        const std::vector<LoggedLine> trace = lines(XLOG_LEVEL_I), errors = lines(XLOG_LEVEL_E);
+        ASSERT_FALSE(trace.empty());
+        EXPECT_EQ(trace[0].text, at(trace[0], "called for abcd\n")) << "the earlier call's name";
         ASSERT_EQ(errors.size(), 1u);
         EXPECT_EQ(errors[0].text, std::string(kConnect) + ": service " + row.line);
     }
-}
-
-TEST_F(VmsgGuestClientTest, Connect_AfterFailure_KeepsNewNameAndOutWords) {
-    EXPECT_FALSE(client.connect(0x64636261));
-    VmsgDeviceScript script;
-    script.mmapFails = true;
-    script.hostBoundCapacity = 1234;
-    vmsgDeviceConfigure(script);
-    log.clear();
-
-    EXPECT_FALSE(client.connect(kHcal));
-    const std::vector<LoggedLine> trace = lines(XLOG_LEVEL_I);
-    ASSERT_FALSE(trace.empty());
-    EXPECT_EQ(trace[0].text, at(trace[0], "called for abcd\n"))
-        << "the trace names the service of the earlier call";
-    EXPECT_EQ(client.mServiceName, "hcal");
-    EXPECT_EQ(client.mMaxHostBoundSize, 1234u) << "out-words of a successful CONNECT stay";
 }
 
 }  // namespace
