@@ -25,13 +25,16 @@ char gBuffer[16];
 int32_t gValue;
 uint64_t gTime;
 
+// Every row starts with gBuffer holding "before". The exit line's format is
+// "returning [%d] from " and the entry format unless the row names another.
 struct Row {
     const char* name;
     ScriptTweak tweak;
     void (*call)();
     const char* signature;
-    std::string entryFormat, entry;
-    std::string exitFormat, exit;  // empty: the call writes no exit line
+    std::string format, entry;
+    std::string exit;  // empty: the call writes no exit line
+    const char* exitFormat = nullptr;
 };
 
 TEST(HcallLog, Lines_OfEveryShape_AreExact) {
@@ -41,27 +44,23 @@ TEST(HcallLog, Lines_OfEveryShape_AreExact) {
     const char* locale = "xerr_t hcallOnLocaleChangedRpc(const char *)";
     const Row rows[] = {
         {"no parameters", nullptr, [] { hcallLaunchOrxRpc(); }, "xerr_t hcallLaunchOrxRpc()",
-         "%s()\n", "hcallLaunchOrxRpc()\n", "returning [%d] from %s()\n",
-         "returning [0] from hcallLaunchOrxRpc()\n"},
+         "%s()\n", "hcallLaunchOrxRpc()\n", "returning [0] from hcallLaunchOrxRpc()\n"},
         {"string, host's result", [](VmsgDeviceScript& s) { s.results[12] = -12; },
          [] { hcallOnLocaleChangedRpc("en-US"); }, locale, "%s(%s)\n",
-         "hcallOnLocaleChangedRpc(en-US)\n", "returning [%d] from %s(%s)\n",
+         "hcallOnLocaleChangedRpc(en-US)\n",
          "returning [-12] from hcallOnLocaleChangedRpc(en-US)\n"},
         {"bool and ints", [](VmsgDeviceScript& s) { s.results[4] = 7; },
          [] { hcallInitVolumeRpc(true, -5, 15); }, "xerr_t hcallInitVolumeRpc(bool, i32, i32)",
          "%s(%d, %d, %d)\n", "hcallInitVolumeRpc(1, -5, 15)\n",
-         "returning [%d] from %s(%d, %d, %d)\n",
          "returning [7] from hcallInitVolumeRpc(1, -5, 15)\n"},
         {"i32 before an empty string", nullptr, [] { hcallOnVibrateRpc(100, ""); },
          "xerr_t hcallOnVibrateRpc(i32, const char *)", "%s(%d, %s)\n",
-         "hcallOnVibrateRpc(100, )\n", "returning [%d] from %s(%d, %s)\n",
-         "returning [0] from hcallOnVibrateRpc(100, )\n"},
+         "hcallOnVibrateRpc(100, )\n", "returning [0] from hcallOnVibrateRpc(100, )\n"},
         {"eight parameters", nullptr,
          [] { hcallOnAppInstalledRpc("p", "a", "l", 3, "v", "i", "s", 0); },
          "xerr_t hcallOnAppInstalledRpc(const char *, const char *, const char *, i32, "
          "const char *, const char *, const char *, bool)",
          "%s(%s, %s, %s, %d, %s, %s, %s, %d)\n", "hcallOnAppInstalledRpc(p, a, l, 3, v, i, s, 0)\n",
-         "returning [%d] from %s(%s, %s, %s, %d, %s, %s, %s, %d)\n",
          "returning [0] from hcallOnAppInstalledRpc(p, a, l, 3, v, i, s, 0)\n"},
         {"launch query prints the reply byte",
          [](VmsgDeviceScript& s) {
@@ -69,63 +68,47 @@ TEST(HcallLog, Lines_OfEveryShape_AreExact) {
              s.rawReply = {2, 0, 0, 0};
          },
          [] { hcallIsAppLaunchAllowedRpc("x"); }, "bool hcallIsAppLaunchAllowedRpc(const char *)",
-         "%s(%s)\n", "hcallIsAppLaunchAllowedRpc(x)\n", "returning [%d] from %s(%s)\n",
+         "%s(%s)\n", "hcallIsAppLaunchAllowedRpc(x)\n",
          "returning [2] from hcallIsAppLaunchAllowedRpc(x)\n"},
         {"buffer before and after filling", [](VmsgDeviceScript& s) { s.propsText = "after"; },
-         [] {
-             std::strcpy(gBuffer, "before");
-             hcallGetPropsRpc(gBuffer, 16, &gValue);
-         },
-         props, "%s(%s, %d, %p)\n", "hcallGetPropsRpc(before, 16, " + v + ")\n",
-         "returning [%d] from %s(%s, %d, %p)\n",
+         [] { hcallGetPropsRpc(gBuffer, 16, &gValue); }, props, "%s(%s, %d, %p)\n",
+         "hcallGetPropsRpc(before, 16, " + v + ")\n",
          "returning [0] from hcallGetPropsRpc(after, 16, " + v + ")\n"},
         {"u64 before the buffer", [](VmsgDeviceScript& s) { s.timeText = "tz"; },
-         [] {
-             std::strcpy(gBuffer, "before");
-             hcallGetTimeInfoRpc(&gTime, gBuffer, 16);
-         },
-         time, "%s(%p, %s, %d)\n", "hcallGetTimeInfoRpc(" + t + ", before, 16)\n",
-         "returning [%d] from %s(%p, %s, %d)\n",
+         [] { hcallGetTimeInfoRpc(&gTime, gBuffer, 16); }, time, "%s(%p, %s, %d)\n",
+         "hcallGetTimeInfoRpc(" + t + ", before, 16)\n",
          "returning [0] from hcallGetTimeInfoRpc(" + t + ", tz, 16)\n"},
         {"null target skipped, buffer still filled", [](VmsgDeviceScript& s) { s.timeText = "tz"; },
-         [] {
-             std::strcpy(gBuffer, "before");
-             hcallGetTimeInfoRpc(nullptr, gBuffer, 16);
-         },
-         time, "%s(%p, %s, %d)\n", "hcallGetTimeInfoRpc((nil), before, 16)\n",
-         "returning [%d] from %s(%p, %s, %d)\n",
+         [] { hcallGetTimeInfoRpc(nullptr, gBuffer, 16); }, time, "%s(%p, %s, %d)\n",
+         "hcallGetTimeInfoRpc((nil), before, 16)\n",
          "returning [0] from hcallGetTimeInfoRpc((nil), tz, 16)\n"},
         // A buffer of capacity 0 has no byte the call may read.
         {"capacity 0 prints nothing of the buffer", [](VmsgDeviceScript& s) { s.propsText = "x"; },
-         [] {
-             std::strcpy(gBuffer, "before");
-             hcallGetPropsRpc(gBuffer, 0, nullptr);
-         },
-         props, "%s(%.*s, %d, %p)\n", "hcallGetPropsRpc(, 0, (nil))\n",
-         "returning [%d] from %s(%.*s, %d, %p)\n",
-         "returning [0] from hcallGetPropsRpc(, 0, (nil))\n"},
+         [] { hcallGetPropsRpc(gBuffer, 0, nullptr); }, props, "%s(%.*s, %d, %p)\n",
+         "hcallGetPropsRpc(, 0, (nil))\n", "returning [0] from hcallGetPropsRpc(, 0, (nil))\n"},
         // Regression: the filled buffer was printed with a plain "%s", so host
         // data without a NUL in the buffer was read past its end.
         {"host leaves the buffer unterminated",
          [](VmsgDeviceScript& s) { s.propsText = "ABCDEFGHIJKL"; },
          [] {
-             std::memset(gBuffer, 'Z', 15);
+             std::memset(gBuffer, 'Z', 15);  // what a print past the capacity would show
              gBuffer[0] = gBuffer[15] = '\0';
              hcallGetPropsRpc(gBuffer, 8, &gValue);
          },
          props, "%s(%s, %d, %p)\n", "hcallGetPropsRpc(, 8, " + v + ")\n",
-         "returning [%d] from %s(%.*s, %d, %p)\n",
-         "returning [0] from hcallGetPropsRpc(ABCDEFGH, 8, " + v + ")\n"},
+         "returning [0] from hcallGetPropsRpc(ABCDEFGH, 8, " + v + ")\n",
+         "returning [%d] from %s(%.*s, %d, %p)\n"},
         {"refused call stops after its entry line",
          [](VmsgDeviceScript& s) { s.hostBoundCapacity = 16; },
          [] { hcallOnLocaleChangedRpc("too long for sixteen"); }, locale, "%s(%s)\n",
-         "hcallOnLocaleChangedRpc(too long for sixteen)\n", "", ""},
+         "hcallOnLocaleChangedRpc(too long for sixteen)\n", ""},
     };
     LogRecorder log;
     for (const Row& row : rows) {
         SCOPED_TRACE(row.name);
         HcallSession session(scriptWith(row.tweak));
         ASSERT_TRUE(session.connected());
+        std::strcpy(gBuffer, "before");
         log.clear();
         row.call();
         const std::vector<LoggedLine> lines = log.lines(XLOG_MODULE_HCALL);
@@ -136,11 +119,12 @@ TEST(HcallLog, Lines_OfEveryShape_AreExact) {
             EXPECT_GT(line.line, 0);
         }
         EXPECT_EQ(lines[0].level, XLOG_LEVEL_I) << "the entry line is info";
-        EXPECT_EQ(lines[0].format, row.entryFormat);
+        EXPECT_EQ(lines[0].format, row.format);
         EXPECT_EQ(lines[0].text, row.entry);
         if (lines.size() < 2) continue;
         EXPECT_EQ(lines[1].level, XLOG_LEVEL_D) << "the exit line is debug";
-        EXPECT_EQ(lines[1].format, row.exitFormat);
+        EXPECT_EQ(lines[1].format,
+                  row.exitFormat ? row.exitFormat : "returning [%d] from " + row.format);
         EXPECT_EQ(lines[1].text, row.exit);
     }
 }
