@@ -105,6 +105,8 @@ TEST(HcallHost, Reply_ShortOrWithStrayBytes_ReadsAsTheGuestReadsIt) {
     ASSERT_EQ(hcallBuildReply(r, 0, out.data(), out.size()), 12u);
     EXPECT_EQ(out, hex("61000000 09000000 00000000")) << "a short text is NUL-padded";
     EXPECT_EQ(hcallBuildReply(r, 0, out.data(), 11), 0u) << "11 bytes cannot hold the reply";
+    ASSERT_EQ(hcallBuildReply(parse("18000000 0E000000 02000000 7000"), 2, out.data(), 4), 4u);
+    EXPECT_EQ(out, hex("01000000 09000000 00000000")) << "a launch answer is a bool field";
 }
 
 // Records what each overridden entry receives.

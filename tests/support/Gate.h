@@ -26,12 +26,17 @@ class Gate {
         open_ = true;
         cond_.notify_all();
     }
+
     // True once the gate is open; false when the tolerance ran out first.
     bool wait(std::chrono::milliseconds tolerance = kGateTolerance) {
         std::unique_lock<std::mutex> lock(mutex_);
         return cond_.wait_for(lock, tolerance, [this] { return open_; });
     }
-    bool isOpen() { return wait(std::chrono::milliseconds(0)); }
+
+    bool isOpen() {
+        std::lock_guard<std::mutex> lock(mutex_);
+        return open_;
+    }
 
   private:
     std::mutex mutex_;
@@ -47,12 +52,14 @@ class EventLog {
         events_.push_back(event);
         cond_.notify_all();
     }
+
     // True once at least `count` events are in; false when the tolerance ran
     // out first.
     bool waitForCount(size_t count, std::chrono::milliseconds tolerance = kGateTolerance) {
         std::unique_lock<std::mutex> lock(mutex_);
         return cond_.wait_for(lock, tolerance, [&] { return events_.size() >= count; });
     }
+
     std::vector<std::string> events() {
         std::lock_guard<std::mutex> lock(mutex_);
         return events_;
