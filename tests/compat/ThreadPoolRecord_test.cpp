@@ -125,12 +125,16 @@ TEST(ThreadPoolRecord, Init_WhenCountZeroOrNegative_StartsNoWorkerAndKeepsTasksQ
 
 TEST(ThreadPoolRecord, Init_WhenSeveralWorkers_RunsTasksSideBySide) {
     onStackAndHeap([](ThreadPool& pool) {
-        Gate secondStarted;
+        Gate warm, secondStarted;
         std::atomic<bool> sawSecond{false};
         ASSERT_EQ(xthrPoolInit(&pool, 2), XERR_SUCCESS);
-        // Only a second worker can open this gate.
+        xthrPoolAddTask(&pool, [&] { warm.open(); });
+        ASSERT_TRUE(warm.wait());
+        // The workers wait for work now: each added task must wake one, and
+        // only a second worker can open this gate.
         xthrPoolAddTask(&pool, [&] { sawSecond = secondStarted.wait(); });
         xthrPoolAddTask(&pool, [&] { secondStarted.open(); });
+        EXPECT_TRUE(secondStarted.wait()) << "the tasks waited for xthrPoolFini";
         xthrPoolFini(&pool);
         EXPECT_TRUE(sawSecond);
     });
