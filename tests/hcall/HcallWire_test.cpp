@@ -86,20 +86,6 @@ TEST(HcallWire, Call_AgainstTheLimitsAndFailures_IsSentOrRefused) {
     }
 }
 
-TEST(HcallWire, GetBufferSizes_ReportsTheCapacitiesAndSkipsNullPointers) {
-    LogRecorder log(XLOG_LEVEL_E);
-    int sizes[2] = {-1, -1};
-    HcallSession session(scriptWith([](VmsgDeviceScript& s) {
-        s.hostBoundCapacity = 1000;
-        s.guestBoundCapacity = 3000;
-    }));
-    hcallGetBufferSizes(nullptr, nullptr);
-    hcallGetBufferSizes(&sizes[0], nullptr);
-    EXPECT_EQ(sizes[0], 1000);
-    hcallGetBufferSizes(nullptr, &sizes[1]);
-    EXPECT_EQ(sizes[1], 3000);
-}
-
 // A string of `length` bytes of 'a' without using that much memory: one
 // small shared page run mapped over and over, then a NUL.
 class HugeString {
