@@ -64,8 +64,10 @@ TEST(ServiceStart, Start_WhenTheWorkerCouldNotBeCreated_StartsItOnTheNextCall) {
             bridge::startService();
         }
         if (workers() != 0) return "a worker that was never created counts";
+        if (xlogSetLevels("HCALL:V") != XERR_SUCCESS) return "levels refused";
         bridge::startService();
         if (countEvents(VmsgDeviceEventKind::Open) != 1) return "the device was opened again";
+        if (!xlogShouldLog(XLOG_MODULE_HCALL, XLOG_LEVEL_V)) return "the levels were reset";
         return workers() == 1 ? "" : "no worker after the retry";
     });
     EXPECT_TRUE(child.ok()) << child.message;
