@@ -8,7 +8,7 @@
 #include <vector>
 
 #include "FuzzCheck.h"
-#include "FuzzLogger.h"
+#include "support/LogRecorder.h"
 #include "xpl/Xlog.h"
 #include "xpl/Xstr.h"
 
@@ -50,15 +50,18 @@ xerr_t referenceLevels(const std::string& spec, int* levels) {
     return XERR_SUCCESS;
 }
 
+LogRecorder* gLog = nullptr;
+
 }  // namespace
 
 extern "C" int LLVMFuzzerInitialize(int*, char***) {
-    xlogLibInit(nullptr, "", "");     // fills the level letters and the module tags
-    fuzz::installFormattingLogger();  // lines are formatted, then dropped
+    xlogLibInit(nullptr, "", "");  // fills the level letters and the module tags
+    gLog = new LogRecorder();      // lines are formatted in full, then dropped
     return 0;
 }
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
+    gLog->clear();
     if (size < 2) return 0;
     const std::string input(reinterpret_cast<const char*>(data) + 1, size - 1);
     if (data[0] & 1) {

@@ -10,10 +10,7 @@
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
-#include <poll.h>
-#include <signal.h>
 #include <sys/mman.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <atomic>
@@ -27,6 +24,7 @@
 
 #include "VmsgDeviceModel.h"
 #include "hcall/guest/HcallEnc.h"
+#include "support/ChildProcess.h"
 #include "support/Gate.h"
 #include "xpl/XthrPool.h"
 #include "xpl/Xtimer.h"
@@ -35,7 +33,6 @@ namespace {
 
 // What a child shares with its exit-time checks. Never freed.
 struct Probe {
-    int reportFd = -1;
     bool armed = false;
     std::atomic<bool> exitBegun{false};
     long returnDelayUs = 0;
@@ -49,10 +46,7 @@ struct Probe {
 };
 Probe* gProbe = nullptr;
 
-void say(const std::string& text) { (void)!write(gProbe->reportFd, text.data(), text.size()); }
-
-// Far beyond the few milliseconds an exit takes, even under a sanitizer.
-constexpr std::chrono::seconds kExitWatchdog{20};
+void say(const std::string& text) { childReport(text); }
 
 // Built before the library's records and so destroyed after them: keeps the
 // process alive a little past their teardown, so that a thread coming back
@@ -91,46 +85,21 @@ void waitUntilParked(pid_t tid) {
     say("thread never parked\n");
 }
 
-// Forks; the child sets up one state, arms the checks and calls exit().
-// Returns what went wrong: "" for a clean exit with nothing reported.
-std::string exitAfter(const std::function<void()>& setUp, long returnDelayUs = 0) {
-    int fds[2];
-    if (pipe2(fds, O_CLOEXEC) != 0) return "pipe failed";
-    pid_t pid = fork();
-    if (pid == 0) {
-        close(fds[0]);
-        gProbe = new Probe();
-        gProbe->reportFd = fds[1];
-        gProbe->returnDelayUs = returnDelayUs;
-        // Runs before the library's exit-time destructors, registered at load.
-        atexit([] { gProbe->exitBegun = true; });
-        setUp();
-        gProbe->armed = true;
-        std::exit(0);
-    }
-    close(fds[1]);
-    std::string output;
-    int status = 0;
-    bool hung = false;
-    auto deadline = std::chrono::steady_clock::now() + kExitWatchdog;
-    for (bool reaped = false; !reaped;) {
-        pollfd readable{fds[0], POLLIN, 0};
-        char buf[512];
-        ssize_t got = poll(&readable, 1, 10) > 0 ? read(fds[0], buf, sizeof(buf)) : 0;
-        if (got > 0) output.append(buf, size_t(got));
-        reaped = waitpid(pid, &status, WNOHANG) == pid;
-        if (!reaped && std::chrono::steady_clock::now() > deadline) {
-            kill(pid, SIGKILL);
-            reaped = hung = waitpid(pid, &status, 0) == pid;
-        }
-    }
-    char buf[512];
-    for (ssize_t got; (got = read(fds[0], buf, sizeof(buf))) > 0;) output.append(buf, size_t(got));
-    close(fds[0]);
-    if (hung) return "hung; " + output;
-    if (WIFSIGNALED(status)) return "killed by signal " + std::to_string(WTERMSIG(status));
-    if (WEXITSTATUS(status) != 0) return "exit status " + std::to_string(WEXITSTATUS(status));
-    return output;
+// A child sets up one state, arms the checks and calls exit(). Returns what
+// went wrong: "" for a clean exit with nothing reported.
+std::string exitAfter(void (*setUp)(), long returnDelayUs = 0) {
+    ChildOutcome child = runInChild(
+        [&]() -> std::string {
+            gProbe = new Probe();
+            gProbe->returnDelayUs = returnDelayUs;
+            // Runs before the library's exit-time destructors, registered at load.
+            atexit([] { gProbe->exitBegun = true; });
+            setUp();
+            gProbe->armed = true;
+            std::exit(0);
+        },
+        std::chrono::seconds(20));
+    return child.ok() ? "" : child.describe();
 }
 
 void connect() {

@@ -1,8 +1,6 @@
-// Test helpers around the device model: a fresh script per test, g_hcall
-// connected to it, and readers for what the device saw.
+// g_hcall connected to the device model, and readers for what the device saw.
 #pragma once
 
-#include <cstring>
 #include <string>
 #include <vector>
 
@@ -33,21 +31,16 @@ class HcallSession {
     bool connected_ = false;
 };
 
-inline std::vector<uint8_t> bytes(std::initializer_list<int> values) {
-    std::vector<uint8_t> out;
-    for (int v : values) out.push_back(uint8_t(v));
-    return out;
+// A script changed by `tweak`, for table rows.
+using ScriptTweak = void (*)(VmsgDeviceScript&);
+inline VmsgDeviceScript scriptWith(ScriptTweak tweak) {
+    VmsgDeviceScript script;
+    if (tweak) tweak(script);
+    return script;
 }
 
 inline size_t countEvents(VmsgDeviceEventKind kind) {
     size_t n = 0;
     for (const VmsgDeviceEvent& event : vmsgDeviceEvents()) n += event.kind == kind;
     return n;
-}
-
-// The one exchange the device saw since the last reset; an empty record (code
-// 0) when there was not exactly one.
-inline VmsgDeviceExchange onlyExchange() {
-    std::vector<VmsgDeviceExchange> all = vmsgDeviceExchanges();
-    return all.size() == 1 ? all[0] : VmsgDeviceExchange();
 }

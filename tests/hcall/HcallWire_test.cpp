@@ -1,6 +1,6 @@
-// Host calls on the wire, through the device model, beyond what the golden
-// corpus holds: replies no proper host builds, the limits of both shared
-// buffers, and exchanges that fail or never start.
+// Host calls through the device model beyond what the golden corpus holds:
+// the limits of both shared buffers, replies no proper host builds, and
+// exchanges that fail or never start.
 
 #include <gtest/gtest.h>
 #include <sys/mman.h>
@@ -11,82 +11,79 @@
 #include <string>
 
 #include "DeviceSession.h"
-#include "LogRecorder.h"
+#include "support/LogRecorder.h"
 
 namespace {
 
-class HcallWireTest : public ::testing::Test {
-  protected:
-    LogRecorder log{XLOG_LEVEL_E};  // keeps the run quiet; lines are checked elsewhere
-};
+char gBuffer[80];
+int32_t gValue;
+uint64_t gTime;
 
-TEST_F(HcallWireTest, IsAppLaunchAllowed_ReadsOnlyTheFirstByteOfTheReply) {
-    struct Case {
-        std::vector<uint8_t> reply;
-        bool allowed;
+std::string letters(size_t n) { return std::string(n, 'x'); }
+
+// Boundary rows come in threes around each limit. A locale of n letters makes
+// a request of 13 + n bytes; props with a buffer of n bytes a reply of 8 + n.
+TEST(HcallWire, Call_AgainstTheLimitsAndFailures_IsSentOrRefused) {
+    const struct {
+        const char* name;
+        ScriptTweak tweak;
+        int64_t (*call)();
+        int64_t want;
+        size_t sent;  // exchanges that reached the host
+    } rows[] = {
+        {"request one below host-bound capacity",
+         [](VmsgDeviceScript& s) { s.hostBoundCapacity = 64; },
+         [] { return int64_t(hcallOnLocaleChangedRpc(letters(50).c_str())); }, 0, 1},
+        {"request at host-bound capacity", [](VmsgDeviceScript& s) { s.hostBoundCapacity = 64; },
+         [] { return int64_t(hcallOnLocaleChangedRpc(letters(51).c_str())); }, 0, 1},
+        {"request one over host-bound capacity",
+         [](VmsgDeviceScript& s) { s.hostBoundCapacity = 64; },
+         [] { return int64_t(hcallOnLocaleChangedRpc(letters(52).c_str())); }, -1, 0},
+        // Regression: the expected reply was never compared with the
+        // guest-bound capacity, so a large buffer was read from beyond the
+        // mapping.
+        {"reply one below guest-bound capacity",
+         [](VmsgDeviceScript& s) { s.guestBoundCapacity = 72; },
+         [] { return int64_t(hcallGetPropsRpc(gBuffer, 63, &gValue)); }, 0, 1},
+        {"reply at guest-bound capacity", [](VmsgDeviceScript& s) { s.guestBoundCapacity = 72; },
+         [] { return int64_t(hcallGetPropsRpc(gBuffer, 64, &gValue)); }, 0, 1},
+        {"reply one over guest-bound capacity",
+         [](VmsgDeviceScript& s) { s.guestBoundCapacity = 72; },
+         [] { return int64_t(hcallGetPropsRpc(gBuffer, 65, &gValue)); }, -1, 0},
+        // Regression: a negative buffer length became a 4 GiB copy.
+        {"buffer length -1", nullptr,
+         [] { return int64_t(hcallGetPropsRpc(gBuffer, -1, &gValue)); }, -1, 0},
+        {"buffer length INT32_MIN", nullptr,
+         [] { return int64_t(hcallGetTimeInfoRpc(&gTime, gBuffer, INT32_MIN)); }, -1, 0},
+        {"exchange fails: no reply is read", [](VmsgDeviceScript& s) { s.sendErrno = EPIPE; },
+         [] { return int64_t(hcallGetPropsRpc(gBuffer, 8, &gValue)); }, -1, 1},
+        {"launch answer is the first byte, not 0",
+         [](VmsgDeviceScript& s) {
+             s.replyMode = VmsgDeviceReplyMode::Raw;
+             s.rawReply = {0x02, 0xFF, 0xFF, 0xFF};
+         },
+         [] { return int64_t(hcallIsAppLaunchAllowedRpc("a")); }, 1, 1},
+        {"launch answer is the first byte, 0",
+         [](VmsgDeviceScript& s) {
+             s.replyMode = VmsgDeviceReplyMode::Raw;
+             s.rawReply = {0x00, 0xFF, 0xFF, 0xFF};
+         },
+         [] { return int64_t(hcallIsAppLaunchAllowedRpc("a")); }, 0, 1},
+        {"never connected: a header-only call", [](VmsgDeviceScript& s) { s.openErrno = ENOENT; },
+         [] { return int64_t(hcallLaunchOrxRpc()); }, -1, 0},
+        // Chosen: a host that cannot be asked does not veto launches.
+        {"never connected: the launch query", [](VmsgDeviceScript& s) { s.openErrno = ENOENT; },
+         [] { return int64_t(hcallIsAppLaunchAllowedRpc("a")); }, 1, 0},
     };
-    const Case cases[] = {
-        {bytes({0x02, 0xFF, 0xFF, 0xFF}), true},
-        {bytes({0x00, 0xFF, 0xFF, 0xFF}), false},
-    };
-    for (const Case& c : cases) {
-        VmsgDeviceScript script;
-        script.replyMode = VmsgDeviceReplyMode::Raw;
-        script.rawReply = c.reply;
+    LogRecorder log(XLOG_LEVEL_E);  // keeps the run quiet; lines are checked in HcallLog_test
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.name);
+        const VmsgDeviceScript script = scriptWith(row.tweak);
         HcallSession session(script);
-        ASSERT_TRUE(session.connected());
-        EXPECT_EQ(hcallIsAppLaunchAllowedRpc("com.example"), c.allowed)
-            << "reply starting " << int(c.reply[0]);
+        ASSERT_EQ(session.connected(), script.openErrno == 0);
+        EXPECT_EQ(row.call(), row.want);
+        EXPECT_EQ(countEvents(VmsgDeviceEventKind::SendReceive), row.sent);
     }
-}
-
-TEST_F(HcallWireTest, Request_AtHostBoundCapacity_IsSentAndOneByteMoreIsRefused) {
-    VmsgDeviceScript script;
-    script.hostBoundCapacity = 64;
-    HcallSession session(script);
-    ASSERT_TRUE(session.connected());
-    const std::string fits(64 - 13, 'x');
-    const std::string tooLong(64 - 12, 'y');
-
-    EXPECT_EQ(hcallOnLocaleChangedRpc(fits.c_str()), 0);
-    ASSERT_EQ(vmsgDeviceExchanges().size(), 1u);
-    EXPECT_EQ(vmsgDeviceExchanges()[0].request.size(), 64u);
-    std::vector<uint8_t> before(64);
-    std::memcpy(before.data(), g_hcall.client.mHostBoundBuf, 64);
-
-    EXPECT_EQ(hcallOnLocaleChangedRpc(tooLong.c_str()), -1);
-    EXPECT_EQ(vmsgDeviceExchanges().size(), 1u) << "nothing is sent";
-    EXPECT_EQ(std::memcmp(before.data(), g_hcall.client.mHostBoundBuf, 64), 0)
-        << "nothing is written";
-}
-
-// Regression: the expected reply was never compared with the guest-bound
-// capacity, so a large filled buffer was read from beyond the mapping.
-TEST_F(HcallWireTest, Reply_LargerThanGuestBoundCapacity_IsRefusedBeforeSending) {
-    VmsgDeviceScript script;
-    script.guestBoundCapacity = 72;
-    script.propsText = "x";
-    HcallSession session(script);
-    ASSERT_TRUE(session.connected());
-    char buffer[65] = "";
-    int32_t value = 5;
-
-    EXPECT_EQ(hcallGetPropsRpc(buffer, 64, &value), 0) << "64 + 4 + 4 bytes fit exactly";
-    EXPECT_EQ(hcallGetPropsRpc(buffer, 65, &value), -1) << "one byte more does not";
-    EXPECT_EQ(vmsgDeviceExchanges().size(), 1u);
-}
-
-// Regression: a negative buffer length became a 4 GiB copy out of the reply.
-TEST_F(HcallWireTest, FilledBuffer_WithNegativeLength_IsRefusedBeforeSending) {
-    HcallSession session;
-    ASSERT_TRUE(session.connected());
-    char buffer[4] = "";
-    int32_t value = 0;
-    uint64_t time = 0;
-
-    EXPECT_EQ(hcallGetPropsRpc(buffer, -1, &value), -1);
-    EXPECT_EQ(hcallGetTimeInfoRpc(&time, buffer, INT32_MIN), -1);
-    EXPECT_EQ(vmsgDeviceExchanges().size(), 0u);
 }
 
 // A string of `length` bytes of 'a' without using that much memory: one
@@ -124,10 +121,11 @@ class HugeString {
 // Regression: the total length was summed in 32 bits, so strings of several
 // GiB wrapped it to a small number that passed the capacity test, and the
 // strings were then copied over the end of the shared buffer.
-TEST_F(HcallWireTest, Request_WhoseLengthWrapsIn32Bits_IsRefusedWithNothingWritten) {
+TEST(HcallWire, Request_WhoseLengthWrapsIn32Bits_IsRefusedWithNothingWritten) {
 #if defined(__SANITIZE_THREAD__)
     GTEST_SKIP() << "ThreadSanitizer would shadow every byte of the 4 GiB of strings";
 #endif
+    LogRecorder log(XLOG_LEVEL_E);
     // Six copies of one string: 46 + 6 * 715827890 = 2^32 + 90 bytes.
     const size_t length = 715827890;
     HugeString huge(length);
@@ -141,55 +139,8 @@ TEST_F(HcallWireTest, Request_WhoseLengthWrapsIn32Bits_IsRefusedWithNothingWritt
     EXPECT_EQ(hcallOnAppInstalledRpc(s, s, s, 1, s, s, s, false), -1);
 
     EXPECT_EQ(vmsgDeviceExchanges().size(), 0u);
-    const uint8_t* buffer = static_cast<const uint8_t*>(g_hcall.client.mHostBoundBuf);
-    EXPECT_EQ(buffer[0], 0xEE) << "not even the header is written";
-}
-
-TEST_F(HcallWireTest, Call_WhenTheExchangeFails_ReturnsFailure) {
-    VmsgDeviceScript script;
-    script.sendErrno = EPIPE;
-    HcallSession session(script);
-    ASSERT_TRUE(session.connected());
-    char buffer[8] = "keep";
-    int32_t value = 42;
-
-    EXPECT_EQ(hcallOnLocaleChangedRpc("fr"), -1);
-    EXPECT_EQ(hcallGetPropsRpc(buffer, 8, &value), -1);
-    EXPECT_STREQ(buffer, "keep") << "no reply is read";
-    EXPECT_EQ(value, 42);
-}
-
-TEST_F(HcallWireTest, Call_WhenNeverConnected_IsRefused) {
-    HcallSession session([] {
-        VmsgDeviceScript script;
-        script.openErrno = ENOENT;
-        return script;
-    }());
-    ASSERT_FALSE(session.connected());
-
-    EXPECT_EQ(hcallLaunchOrxRpc(), -1) << "a header-only call fits no buffer at all";
-    EXPECT_EQ(hcallOnLocaleChangedRpc("en"), -1);
-    // Chosen: a host that cannot be asked does not veto launches.
-    EXPECT_TRUE(hcallIsAppLaunchAllowedRpc("com.example"));
-    EXPECT_EQ(vmsgDeviceEvents().size(), 1u) << "only the failed open reached the device";
-}
-
-TEST_F(HcallWireTest, GetBufferSizes_ReportsCapacitiesAndSkipsNullPointers) {
-    VmsgDeviceScript script;
-    script.hostBoundCapacity = 1000;
-    script.guestBoundCapacity = 3000;
-    HcallSession session(script);
-    ASSERT_TRUE(session.connected());
-    int host = 0;
-    int guest = 0;
-
-    hcallGetBufferSizes(&host, &guest);
-    EXPECT_EQ(host, 1000);
-    EXPECT_EQ(guest, 3000);
-    hcallGetBufferSizes(nullptr, nullptr);
-    host = 0;
-    hcallGetBufferSizes(&host, nullptr);
-    EXPECT_EQ(host, 1000);
+    EXPECT_EQ(static_cast<const uint8_t*>(g_hcall.client.mHostBoundBuf)[0], 0xEE)
+        << "not even the header is written";
 }
 
 }  // namespace

@@ -6,25 +6,22 @@
 #include <gtest/gtest.h>
 
 #include <cerrno>
-#include <cstring>
-#include <functional>
 #include <string>
 
 #include "DeviceSession.h"
-#include "LogRecorder.h"
+#include "support/LogRecorder.h"
 #include "vmsg/guest/VmsgGuest.h"
 
 namespace {
 
-constexpr char kSource[] = "Source/vmsg/guest/VmsgGuest";
 constexpr char kConnect[] = "bool VmsgGuestClient::connect(VmsgServiceId)";
-constexpr char kDisconnect[] = "void VmsgGuestClient::disconnect()";
-constexpr char kGetHostBoundBuffer[] = "void *VmsgGuestClient::getHostBoundBuffer(uint32_t)";
-constexpr char kProcessRequest[] = "void *VmsgGuestClient::processRequest(void *, uint32_t)";
+constexpr char kGet[] = "void *VmsgGuestClient::getHostBoundBuffer(uint32_t)";
+constexpr char kProcess[] = "void *VmsgGuestClient::processRequest(void *, uint32_t)";
 constexpr VmsgServiceId kHcal = 0x6C616368;
 
-std::string calledFor(const LoggedLine& line, const std::string& name) {
-    return line.function + ":" + std::to_string(line.line) + " called for " + name + "\n";
+// "<function>:<line> <text>", as the lines that lead with "%s:%d" read.
+std::string at(const LoggedLine& line, const std::string& text) {
+    return line.function + ":" + std::to_string(line.line) + " " + text;
 }
 
 class VmsgGuestClientTest : public ::testing::Test {
@@ -34,11 +31,10 @@ class VmsgGuestClientTest : public ::testing::Test {
         if (client.mFd >= 0) client.disconnect();
         vmsgDeviceReset();
     }
-    void configure(const VmsgDeviceScript& script) { vmsgDeviceConfigure(script); }
-    std::vector<LoggedLine> errors() const {
+    std::vector<LoggedLine> lines(int level) const {
         std::vector<LoggedLine> found;
         for (const LoggedLine& line : log.lines(XLOG_MODULE_VMSG))
-            if (line.level == XLOG_LEVEL_E) found.push_back(line);
+            if (line.level == level) found.push_back(line);
         return found;
     }
 
@@ -52,7 +48,7 @@ TEST_F(VmsgGuestClientTest, Connect_WhenDeviceAnswers_OpensConnectsAndMapsAsTheD
     script.guestBoundCapacity = 2048;
     script.spare = 0xA5A5A5A5;
     script.guestBoundOffset = 8192;
-    configure(script);
+    vmsgDeviceConfigure(script);
 
     ASSERT_TRUE(client.connect(kHcal));
 
@@ -64,8 +60,7 @@ TEST_F(VmsgGuestClientTest, Connect_WhenDeviceAnswers_OpensConnectsAndMapsAsTheD
     EXPECT_EQ(static_cast<char*>(client.mGuestBoundBuf),
               static_cast<char*>(client.mHostBoundBuf) + 8192);
     EXPECT_EQ(client.mServiceName, "hcal");
-
-    std::vector<VmsgDeviceEvent> events = vmsgDeviceEvents();
+    const std::vector<VmsgDeviceEvent> events = vmsgDeviceEvents();
     ASSERT_EQ(events.size(), 2u);
     EXPECT_EQ(events[0].kind, VmsgDeviceEventKind::Open);
     EXPECT_EQ(events[0].openFlags, O_RDWR) << "opened read-write and with no other flag";
@@ -74,203 +69,177 @@ TEST_F(VmsgGuestClientTest, Connect_WhenDeviceAnswers_OpensConnectsAndMapsAsTheD
     const std::array<uint8_t, 20> expectedIn = {0x68, 0x63, 0x61, 0x6C};
     EXPECT_EQ(events[1].connectIn, expectedIn) << "service id, then 16 zero bytes";
 
-    std::vector<LoggedLine> lines = log.lines(XLOG_MODULE_VMSG);
-    ASSERT_EQ(lines.size(), 2u);
-    for (const LoggedLine& line : lines) {
-        EXPECT_EQ(line.level, XLOG_LEVEL_I);
-        EXPECT_EQ(line.file, kSource);
+    const std::vector<LoggedLine> trace = lines(XLOG_LEVEL_I);
+    ASSERT_EQ(trace.size(), 2u);
+    for (const LoggedLine& line : trace) {
+        EXPECT_EQ(line.file, "Source/vmsg/guest/VmsgGuest");
         EXPECT_EQ(line.function, kConnect);
     }
-    EXPECT_EQ(lines[0].text, calledFor(lines[0], "")) << "the name is not yet known";
-    EXPECT_EQ(lines[1].text, std::string(kConnect) + ":" + std::to_string(lines[1].line) +
-                                 " mMaxHostBoundSize 4096, mMaxGuestBoundSize 2048 service hcal");
+    EXPECT_EQ(trace[0].text, at(trace[0], "called for \n")) << "the name is not yet known";
+    EXPECT_EQ(trace[1].text,
+              at(trace[1], "mMaxHostBoundSize 4096, mMaxGuestBoundSize 2048 service hcal"));
 }
 
-TEST_F(VmsgGuestClientTest, ProcessRequest_WhenConnected_SharesBothBuffersWithTheHost) {
-    VmsgDeviceScript script;
-    script.results[7] = 0x12345678;
-    configure(script);
+// Capacity 256 when connected. processRequest refuses without a line of its
+// own: the caller's getHostBoundBuffer has already said why.
+TEST_F(VmsgGuestClientTest, Exchange_OfEachLengthAndState_IsServedOrRefused) {
+    enum State { Unconnected, Connected, Disconnected };
+    enum Want { Null, HostBuffer, GuestBuffer };
+    const struct {
+        const char* name;
+        State state;
+        bool process;  // processRequest rather than getHostBoundBuffer
+        uint32_t len;
+        Want want;
+        size_t sent;        // SEND_RECEIVE requests that reached the device
+        std::string error;  // after "<signature>:<line> " or "<signature>: service <name>: "
+        int sendErrno = 0;
+    } rows[] = {
+        {"buffer of 0 bytes", Connected, false, 0, HostBuffer, 0, ""},
+        {"buffer one below capacity", Connected, false, 255, HostBuffer, 0, ""},
+        {"buffer at capacity", Connected, false, 256, HostBuffer, 0, ""},
+        {"buffer one over capacity", Connected, false, 257, Null, 0,
+         "len 257, mMaxHostBoundSize 256"},
+        {"request at capacity", Connected, true, 256, GuestBuffer, 1, ""},
+        {"request one over capacity", Connected, true, 257, Null, 0, ""},
+        {"request the device fails", Connected, true, 8, Null, 1,
+         "SEND_RECEIVE ioctl failed: ret -1, errno 5", EIO},
+        {"buffer before connect", Unconnected, false, 1, Null, 0, "len 1, mMaxHostBoundSize 0"},
+        {"empty buffer before connect", Unconnected, false, 0, Null, 0, "not connected"},
+        {"request before connect", Unconnected, true, 0, Null, 0, ""},
+        // Regression: capacities outlive a disconnect, so an exchange was let
+        // through onto an unmapped buffer and a closed descriptor.
+        {"buffer after disconnect", Disconnected, false, 16, Null, 0, "not connected"},
+        {"request after disconnect", Disconnected, true, 16, Null, 0, ""},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.name);
+        VmsgGuestClient c;
+        VmsgDeviceScript script;
+        script.hostBoundCapacity = 256;
+        script.sendErrno = row.sendErrno;
+        vmsgDeviceReset();
+        vmsgDeviceConfigure(script);
+        if (row.state != Unconnected) {
+            ASSERT_TRUE(c.connect(kHcal));
+        }
+        if (row.state == Disconnected) c.disconnect();
+        vmsgDeviceReset();
+        vmsgDeviceConfigure(script);
+        log.clear();
+
+        void* got =
+            row.process ? c.processRequest(nullptr, row.len) : c.getHostBoundBuffer(row.len);
+        void* want = row.want == HostBuffer ? c.mHostBoundBuf : nullptr;
+        if (row.want == GuestBuffer) want = c.mGuestBoundBuf;
+        const std::vector<LoggedLine> trace = lines(XLOG_LEVEL_I), errors = lines(XLOG_LEVEL_E);
+        if (c.mFd >= 0) c.disconnect();
+
+        EXPECT_EQ(got, want);
+        EXPECT_EQ(countEvents(VmsgDeviceEventKind::SendReceive), row.sent);
+        ASSERT_EQ(trace.size(), 1u);
+        EXPECT_EQ(trace[0].function, row.process ? kProcess : kGet);
+        EXPECT_EQ(trace[0].text, at(trace[0], "called for " + c.mServiceName + "\n"));
+        ASSERT_EQ(errors.size(), row.error.empty() ? 0u : 1u);
+        if (errors.empty()) continue;
+        EXPECT_EQ(errors[0].function, trace[0].function);
+        const std::string service = errors[0].function + ": service " + c.mServiceName + ": ";
+        EXPECT_TRUE(errors[0].text == at(errors[0], row.error) ||
+                    errors[0].text == service + row.error)
+            << errors[0].text;
+    }
+}
+
+TEST_F(VmsgGuestClientTest, Disconnect_ReleasesDeviceOnceAndKeepsTheRecord) {
     ASSERT_TRUE(client.connect(kHcal));
-
-    const std::vector<uint8_t> request = bytes({7, 0, 0, 0, 12, 0, 0, 0, 1, 0, 0, 0});
-    uint8_t* buffer = static_cast<uint8_t*>(client.getHostBoundBuffer(12));
-    ASSERT_EQ(buffer, client.mHostBoundBuf);
-    std::memcpy(buffer, request.data(), request.size());
-    int dummy = 0;
-    void* reply = client.processRequest(&dummy, 12);
-
-    EXPECT_EQ(reply, client.mGuestBoundBuf) << "whatever request pointer is passed";
-    EXPECT_EQ(onlyExchange().request, request) << "the host reads the mapping the guest wrote";
-    int32_t result = 0;
-    std::memcpy(&result, reply, 4);
-    EXPECT_EQ(result, 0x12345678) << "the guest reads the reply the host wrote";
-}
-
-TEST_F(VmsgGuestClientTest, Exchange_AtCapacityBoundaries_AcceptsUpToCapacity) {
-    VmsgDeviceScript script;
-    script.hostBoundCapacity = 256;
-    configure(script);
-    ASSERT_TRUE(client.connect(kHcal));
-    log.clear();
-
-    EXPECT_EQ(client.getHostBoundBuffer(0), client.mHostBoundBuf);
-    EXPECT_EQ(client.getHostBoundBuffer(255), client.mHostBoundBuf);
-    EXPECT_EQ(client.getHostBoundBuffer(256), client.mHostBoundBuf);
-    EXPECT_EQ(client.getHostBoundBuffer(257), nullptr);
-    EXPECT_EQ(client.processRequest(client.mHostBoundBuf, 257), nullptr);
-    EXPECT_EQ(countEvents(VmsgDeviceEventKind::SendReceive), 0u) << "nothing is sent";
-
-    std::vector<LoggedLine> lines = errors();
-    ASSERT_EQ(lines.size(), 1u) << "processRequest refuses without a line of its own";
-    EXPECT_EQ(lines[0].function, kGetHostBoundBuffer);
-    EXPECT_EQ(lines[0].text, std::string(kGetHostBoundBuffer) + ":" +
-                                 std::to_string(lines[0].line) + " len 257, mMaxHostBoundSize 256");
-    EXPECT_EQ(calledFor(log.lines(XLOG_MODULE_VMSG)[0], "hcal"),
-              log.lines(XLOG_MODULE_VMSG)[0].text);
-}
-
-TEST_F(VmsgGuestClientTest, GetHostBoundBuffer_BeforeConnect_RefusesEveryRequest) {
-    EXPECT_EQ(client.mFd, -1);
-    EXPECT_EQ(client.mMaxHostBoundSize, 0u);
-    EXPECT_EQ(client.mHostBoundBuf, nullptr);
-    EXPECT_EQ(client.mServiceName, "");
-    EXPECT_EQ(client.getHostBoundBuffer(1), nullptr);
-    EXPECT_EQ(client.getHostBoundBuffer(0), nullptr) << "there is no buffer to hand out";
-    EXPECT_EQ(client.processRequest(nullptr, 0), nullptr);
-    EXPECT_EQ(vmsgDeviceEvents().size(), 0u) << "nothing reaches a device that was never opened";
-    ASSERT_FALSE(errors().empty());
-    EXPECT_EQ(errors()[0].text, std::string(kGetHostBoundBuffer) + ":" +
-                                    std::to_string(errors()[0].line) +
-                                    " len 1, mMaxHostBoundSize 0");
-}
-
-TEST_F(VmsgGuestClientTest, Disconnect_WhenConnected_ReleasesDeviceAndKeepsTheRecord) {
-    ASSERT_TRUE(client.connect(kHcal));
-    const VmsgGuestClient& c = client;
-    void* host = c.mHostBoundBuf;
-    uint32_t capacity = c.mMaxHostBoundSize;
+    void* host = client.mHostBoundBuf;
     vmsgDeviceReset();
     log.clear();
 
     client.disconnect();
+    client.disconnect();
 
-    std::vector<VmsgDeviceEvent> events = vmsgDeviceEvents();
-    ASSERT_EQ(events.size(), 2u);
+    const std::vector<VmsgDeviceEvent> events = vmsgDeviceEvents();
+    ASSERT_EQ(events.size(), 2u) << "the second disconnect reaches nothing";
     EXPECT_EQ(events[0].kind, VmsgDeviceEventKind::Disconnect);
     EXPECT_EQ(events[0].request, 0x7602UL);
     EXPECT_EQ(events[1].kind, VmsgDeviceEventKind::Close);
     EXPECT_EQ(vmsgDeviceOpenCount(), 0u);
     EXPECT_EQ(client.mFd, -1);
     EXPECT_EQ(client.mHostBoundBuf, host) << "pointers keep their values";
-    EXPECT_EQ(client.mMaxHostBoundSize, capacity) << "sizes keep their values";
+    EXPECT_EQ(client.mMaxHostBoundSize, 65536u) << "sizes keep their values";
     EXPECT_EQ(client.mServiceName, "hcal");
-    ASSERT_EQ(log.lines(XLOG_MODULE_VMSG).size(), 1u);
-    EXPECT_EQ(log.lines(XLOG_MODULE_VMSG)[0].text,
-              calledFor(log.lines(XLOG_MODULE_VMSG)[0], "hcal"));
-    EXPECT_EQ(log.lines(XLOG_MODULE_VMSG)[0].function, kDisconnect);
-
-    // Regression: capacities outlive a disconnect, so an exchange was let
-    // through onto an unmapped buffer and a closed descriptor.
-    vmsgDeviceReset();
-    EXPECT_EQ(client.getHostBoundBuffer(16), nullptr);
-    EXPECT_EQ(client.processRequest(nullptr, 16), nullptr);
-    client.disconnect();
-    EXPECT_EQ(vmsgDeviceEvents().size(), 0u) << "nothing more reaches the device";
+    const std::vector<LoggedLine> trace = log.lines(XLOG_MODULE_VMSG);
+    ASSERT_EQ(trace.size(), 2u) << "each disconnect prints its called-for line";
+    EXPECT_EQ(trace[1].function, "void VmsgGuestClient::disconnect()");
+    EXPECT_EQ(trace[1].text, at(trace[1], "called for hcal\n"));
 }
 
-// The connection failures, one row each: the error line, and the client left
-// unconnected with no descriptor behind. The last two rows guard regressions:
-// a mapping length that wrapped in 32 bits mapped a sliver, and a host-bound
-// capacity beyond the mapping let requests run past its end; neither layout
-// reaches mmap, so neither may say that mmap failed.
+// The connection failures, one row each, on a client whose earlier connect
+// to "abcd" failed: the error line, the client left unconnected with no
+// descriptor behind, the new name kept, and the out-words of a CONNECT that
+// succeeded kept. The last two rows guard regressions: a mapping length that
+// wrapped in 32 bits mapped a sliver, and a host-bound capacity beyond the
+// mapping let requests run past its end; neither layout reaches mmap, so
+// neither may say that mmap failed.
 TEST_F(VmsgGuestClientTest, Connect_WhenAStepFails_ReportsAndStaysUnconnected) {
-    struct Row {
-        const char* what;
-        std::function<void(VmsgDeviceScript&)> fault;
+    const std::string refused =
+        "connection ioctl failed: ret -1, errno " + std::to_string(ECONNREFUSED);
+    const std::string layout = "hcal: impossible buffer layout: mMaxHostBoundSize ";
+    const struct {
+        const char* name;
+        ScriptTweak tweak;
         VmsgServiceId id;
-        std::string line;  // after "<signature>: service "
-    };
-    const std::string e = ", errno ";
-    const std::string layout = "impossible buffer layout: mMaxHostBoundSize ";
-    const Row rows[] = {
+        std::string line;        // after "<signature>: service "
+        uint32_t hostBoundSize;  // what the record holds afterwards
+    } rows[] = {
         {"open", [](VmsgDeviceScript& s) { s.openErrno = ENOENT; }, kHcal,
-         "hcal: open failed for /dev/kivvmsg"},
+         "hcal: open failed for /dev/kivvmsg", 0},
         {"connect", [](VmsgDeviceScript& s) { s.connectErrno = EIO; }, kHcal,
-         "hcal: connection ioctl failed: ret -1, errno 5"},
-        {"unknown service", [](VmsgDeviceScript&) {}, 0x64636261,
-         "abcd: connection ioctl failed: ret -1" + e + std::to_string(ECONNREFUSED)},
-        {"empty name", [](VmsgDeviceScript&) {}, 0x6C616300,
-         ": connection ioctl failed: ret -1" + e + std::to_string(ECONNREFUSED)},
+         "hcal: connection ioctl failed: ret -1, errno 5", 0},
+        {"unknown service", nullptr, 0x64636261, "abcd: " + refused, 0},
+        {"empty name", nullptr, 0x6C616300, ": " + refused, 0},
         {"mmap",
          [](VmsgDeviceScript& s) {
-             s.guestBoundOffset = 4096;
-             s.guestBoundCapacity = 4096;
+             s.guestBoundOffset = s.guestBoundCapacity = 4096;
              s.mmapFails = true;
          },
-         kHcal, "hcal: mmap() failed: size 8192" + e + std::to_string(EPERM)},
+         kHcal, "hcal: mmap() failed: size 8192, errno " + std::to_string(EPERM), 4096},
         {"wrapping length",
          [](VmsgDeviceScript& s) {
              s.guestBoundOffset = 0xFFFFF000;
              s.guestBoundCapacity = 0x2000;
          },
-         kHcal, "hcal: " + layout + "4096, mMaxGuestBoundSize 8192, mGuestBoundOffset 4294963200"},
+         kHcal, layout + "4096, mMaxGuestBoundSize 8192, mGuestBoundOffset 4294963200", 4096},
         {"host-bound beyond mapping",
          [](VmsgDeviceScript& s) {
              s.hostBoundCapacity = 65536;
-             s.guestBoundOffset = 256;
-             s.guestBoundCapacity = 256;
+             s.guestBoundOffset = s.guestBoundCapacity = 256;
          },
-         kHcal, "hcal: " + layout + "65536, mMaxGuestBoundSize 256, mGuestBoundOffset 256"},
+         kHcal, layout + "65536, mMaxGuestBoundSize 256, mGuestBoundOffset 256", 65536},
     };
-    for (const Row& row : rows) {
-        VmsgGuestClient fresh;
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.name);
+        VmsgGuestClient c;
+        vmsgDeviceReset();
+        EXPECT_FALSE(c.connect(0x64636261));
         VmsgDeviceScript script;
         script.hostBoundCapacity = 4096;
-        row.fault(script);
-        vmsgDeviceReset();
-        configure(script);
+        if (row.tweak) row.tweak(script);
+        vmsgDeviceConfigure(script);
         log.clear();
 
-        EXPECT_FALSE(fresh.connect(row.id)) << row.what;
-        EXPECT_EQ(fresh.mFd, -1) << row.what;
-        EXPECT_EQ(vmsgDeviceOpenCount(), 0u) << row.what << ": the device is closed again";
-        ASSERT_EQ(errors().size(), 1u) << row.what;
-        EXPECT_EQ(errors()[0].text, std::string(kConnect) + ": service " + row.line) << row.what;
-        EXPECT_EQ(errors()[0].file, kSource);
-        EXPECT_EQ(fresh.getHostBoundBuffer(16), nullptr)
-            << row.what << ": capacities left by a failed connect do not make it connected";
+        EXPECT_FALSE(c.connect(row.id));
+        EXPECT_EQ(c.mFd, -1);
+        EXPECT_EQ(vmsgDeviceOpenCount(), 0u) << "the device is closed again";
+        EXPECT_EQ(c.mServiceName, row.line.substr(0, row.line.find(':')));
+        EXPECT_EQ(c.mMaxHostBoundSize, row.hostBoundSize);
+        const std::vector<LoggedLine> trace = lines(XLOG_LEVEL_I), errors = lines(XLOG_LEVEL_E);
+        ASSERT_FALSE(trace.empty());
+        EXPECT_EQ(trace[0].text, at(trace[0], "called for abcd\n")) << "the earlier call's name";
+        ASSERT_EQ(errors.size(), 1u);
+        EXPECT_EQ(errors[0].text, std::string(kConnect) + ": service " + row.line);
     }
-}
-
-TEST_F(VmsgGuestClientTest, Connect_AfterFailure_KeepsNewNameAndOutWords) {
-    EXPECT_FALSE(client.connect(0x64636261));
-    VmsgDeviceScript script;
-    script.mmapFails = true;
-    script.hostBoundCapacity = 1234;
-    configure(script);
-    log.clear();
-
-    EXPECT_FALSE(client.connect(kHcal));
-    EXPECT_EQ(log.texts(XLOG_MODULE_VMSG)[0], calledFor(log.lines(XLOG_MODULE_VMSG)[0], "abcd"))
-        << "the trace names the service of the earlier call";
-    EXPECT_EQ(client.mServiceName, "hcal");
-    EXPECT_EQ(client.mMaxHostBoundSize, 1234u) << "out-words of a successful CONNECT stay";
-}
-
-TEST_F(VmsgGuestClientTest, ProcessRequest_WhenSendReceiveFails_ReportsAndReturnsNull) {
-    VmsgDeviceScript script;
-    script.sendErrno = EIO;
-    configure(script);
-    ASSERT_TRUE(client.connect(kHcal));
-    const std::vector<uint8_t> request = bytes({29, 0, 0, 0, 8, 0, 0, 0});
-    std::memcpy(client.getHostBoundBuffer(8), request.data(), request.size());
-
-    EXPECT_EQ(client.processRequest(client.mHostBoundBuf, 8), nullptr);
-    EXPECT_GE(client.mFd, 0) << "a failed exchange changes nothing in the record";
-    ASSERT_EQ(errors().size(), 1u);
-    EXPECT_EQ(errors()[0].text, std::string(kProcessRequest) +
-                                    ": service hcal: SEND_RECEIVE ioctl failed: ret -1, errno 5");
-    EXPECT_EQ(errors()[0].function, kProcessRequest);
 }
 
 }  // namespace
