@@ -3,32 +3,39 @@ package com.zelvane.server.bridgetest;
 import static org.junit.jupiter.api.Assertions.assertTrue;
 
 import com.zelvane.server.KivHostCallService;
+import java.io.ByteArrayOutputStream;
+import java.io.DataOutputStream;
+import java.io.IOException;
+import java.io.UncheckedIOException;
+import java.nio.ByteBuffer;
+import java.nio.ByteOrder;
 import java.time.Duration;
 import java.util.ArrayList;
 import java.util.Arrays;
 import java.util.Collections;
+import java.util.HexFormat;
 import java.util.List;
 import java.util.function.BooleanSupplier;
 
 /**
  * The library loaded into this JVM as the Android runtime loads it, with the
- * Android log captured from before JNI_OnLoad, and a way to wait until the
- * worker has finished everything queued so far.
+ * Android log captured from before JNI_OnLoad; a way to wait until the worker
+ * has run everything queued so far; requests as the host must receive them.
  */
 final class Bridge {
     /** How long the worker may take to drain what a test queued. */
     static final Duration WAIT = Duration.ofSeconds(30);
     static final String TAG = "KivHostCallService-JNI";
-    static final String TASK_SUFFIX = "::(anonymous class)::operator()() const";
 
     /** The event whose delivery shows that every event queued before it has run. */
     private static final int SENTINEL_SECS = -424242;
-    private static final String SENTINEL = Wire.op(42).i32(SENTINEL_SECS).hex();
+    private static final String SENTINEL = request(42, SENTINEL_SECS);
     private static final String SENTINEL_NAME = "setUsageStatsUpdateInterval(JNIEnv *, jobject, int)";
-    private static final String SENTINEL_RETURNING =
-            "3|" + TAG + "|auto " + SENTINEL_NAME + TASK_SUFFIX + ": returning, rval = 0";
+    private static final String SENTINEL_RETURNING = debug(task("jint " + SENTINEL_NAME) + ": returning, rval = 0");
 
     private static KivHostCallService service;
+    /** Every captured line as "priority|tag|text", in order. */
+    private static final List<String> LOG = new ArrayList<>();
 
     private Bridge() {}
 
@@ -46,9 +53,8 @@ final class Bridge {
     /** Loaded and started once for the whole JVM. */
     static synchronized KivHostCallService started() {
         boolean first = service == null;
-        KivHostCallService s = load();
-        if (first) s.native_init();
-        return s;
+        if (first) load().native_init();
+        return service;
     }
 
     static void await(String what, BooleanSupplier condition) {
@@ -69,11 +75,12 @@ final class Bridge {
 
     /** The name a method's task logs under, from the method's name string. */
     static String task(String name) {
-        return "auto " + name.substring(name.indexOf(' ') + 1) + TASK_SUFFIX;
+        return "auto " + name.substring(name.indexOf(' ') + 1) + "::(anonymous class)::operator()() const";
     }
 
-    static List<String> lines() {
-        return new ArrayList<>(Arrays.asList(TestNative.logLines()));
+    static synchronized List<String> lines() {
+        LOG.addAll(Arrays.asList(TestNative.takeLogLines()));
+        return new ArrayList<>(LOG);
     }
 
     /** The bridge's own lines from index `from` of {@link #lines} on. */
@@ -90,18 +97,14 @@ final class Bridge {
      * host has received before it, as hex.
      */
     static List<String> drain(KivHostCallService s, boolean debugOn) {
-        int sent = count(TestNative.requests(), SENTINEL);
-        int logged = count(TestNative.logLines(), SENTINEL_RETURNING);
+        int sent = Collections.frequency(Arrays.asList(TestNative.requests()), SENTINEL);
+        int logged = Collections.frequency(lines(), SENTINEL_RETURNING);
         s.native_setUsageStatsUpdateInterval(SENTINEL_SECS);
-        await("the sentinel event", () -> count(TestNative.requests(), SENTINEL) > sent);
-        if (debugOn) await("its returning line", () -> count(TestNative.logLines(), SENTINEL_RETURNING) > logged);
+        await("the sentinel event", () -> Collections.frequency(Arrays.asList(TestNative.requests()), SENTINEL) > sent);
+        if (debugOn) await("its returning line", () -> Collections.frequency(lines(), SENTINEL_RETURNING) > logged);
         List<String> received = new ArrayList<>(Arrays.asList(TestNative.requests()));
         received.removeAll(List.of(SENTINEL));
         return received;
-    }
-
-    private static int count(String[] items, String item) {
-        return Collections.frequency(Arrays.asList(items), item);
     }
 
     /** The bridge's lines from index `from` on, less the sentinel's, after a drain. */
@@ -112,5 +115,34 @@ final class Bridge {
         int last = lines.lastIndexOf(SENTINEL_RETURNING);
         if (last >= 0) lines.remove(last);
         return lines;
+    }
+
+    /**
+     * A request as the host must receive it, as hex: operation code, total
+     * length, then each Java value packed: a String as its count, its modified
+     * UTF-8 bytes (what Java hands to JNI) and NUL; an int as 4 bytes; a
+     * boolean as 4 bytes, first 1 or 0.
+     */
+    static String request(int op, Object... values) {
+        ByteBuffer b = ByteBuffer.allocate(1 << 16).order(ByteOrder.LITTLE_ENDIAN).putInt(op).putInt(0);
+        for (Object value : values) {
+            if (value instanceof String text) {
+                byte[] utf = modifiedUtf8(text);
+                b.putInt(utf.length + 1).put(utf).put((byte) 0);
+            } else {
+                b.putInt(value instanceof Boolean yes ? (yes ? 1 : 0) : (Integer) value);
+            }
+        }
+        return HexFormat.of().formatHex(b.array(), 0, b.putInt(4, b.position()).position());
+    }
+
+    private static byte[] modifiedUtf8(String text) {
+        try {
+            ByteArrayOutputStream bytes = new ByteArrayOutputStream();
+            new DataOutputStream(bytes).writeUTF(text);
+            return Arrays.copyOfRange(bytes.toByteArray(), 2, bytes.size());
+        } catch (IOException e) {
+            throw new UncheckedIOException(e);
+        }
     }
 }

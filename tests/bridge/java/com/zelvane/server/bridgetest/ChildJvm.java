@@ -4,7 +4,6 @@ import static org.junit.jupiter.api.Assertions.assertEquals;
 import static org.junit.jupiter.api.Assertions.assertFalse;
 import static org.junit.jupiter.api.Assertions.assertTrue;
 
-import java.io.File;
 import java.io.IOException;
 import java.nio.charset.StandardCharsets;
 import java.nio.file.Files;
@@ -16,9 +15,9 @@ import java.util.Map;
 import java.util.concurrent.TimeUnit;
 
 /**
- * A scenario of {@link Scenarios} run in a JVM of its own, with this JVM's
- * -Xcheck:jni, preloads and properties, and what it reported on standard
- * output: lines "RESULT name=value", "LINE android-log-line", "REQ hex".
+ * A scenario of {@link ProcessTest#main} run in a JVM of its own, with this
+ * JVM's -Xcheck:jni, preloads and properties, and what it reported on
+ * standard output.
  */
 final class ChildJvm {
     /** Longest a scenario may take before it counts as hung. */
@@ -39,8 +38,9 @@ final class ChildJvm {
                 "-Xcheck:jni", "-Xmx64m", "-XX:ErrorFile=" + System.getProperty("java.io.tmpdir") + "/hs_err_%p.log"));
         for (String property : List.of("hostcall.lib", "hostcall.testlib"))
             command.add("-D" + property + "=" + System.getProperty(property));
-        command.addAll(List.of("-cp", classPath, Scenarios.class.getName()));
+        command.addAll(List.of("-cp", classPath, ProcessTest.class.getName()));
         command.addAll(List.of(args));
+        String scenario = String.join(" ", args);
         try {
             Path log = Files.createTempFile("bridge-child-", ".out");
             ProcessBuilder builder = new ProcessBuilder(command).redirectErrorStream(true).redirectOutput(log.toFile());
@@ -52,7 +52,6 @@ final class ChildJvm {
             ChildJvm child = new ChildJvm(Files.readString(log, StandardCharsets.UTF_8),
                     Duration.ofNanos(System.nanoTime() - start));
             Files.delete(log);
-            String scenario = String.join(" ", args);
             assertTrue(ended, scenario + " hung:\n" + child.output);
             assertEquals(exitCode, process.exitValue(), scenario + " exit code:\n" + child.output);
             for (String sign : List.of("WARNING in native method", "FATAL ERROR in native method", "SIGSEGV", "SIGABRT",
@@ -60,18 +59,12 @@ final class ChildJvm {
                 assertFalse(child.output.contains(sign), scenario + " reported " + sign + ":\n" + child.output);
             return child;
         } catch (IOException | InterruptedException e) {
-            throw new AssertionError(e);
+            throw new AssertionError(scenario, e);
         }
     }
 
     static ChildJvm run(Map<String, String> env, String... args) {
         return run(0, CLASS_PATH, env, args);
-    }
-
-    /** The class path without the service class, so that JNI_OnLoad cannot register the methods. */
-    static String classPathWithoutService() {
-        return String.join(File.pathSeparator, List.of(CLASS_PATH.split(File.pathSeparator)).stream()
-                .filter(entry -> !entry.endsWith("kivhostcall-service.jar")).toList());
     }
 
     /** The reported values of one kind ("RESULT", "LINE", "REQ"), in order. */
