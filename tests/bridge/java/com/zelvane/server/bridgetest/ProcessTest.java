@@ -18,9 +18,7 @@ import java.util.Arrays;
 import java.util.List;
 import java.util.Map;
 import java.util.SplittableRandom;
-import java.util.concurrent.ExecutorService;
-import java.util.concurrent.Executors;
-import java.util.concurrent.Future;
+import java.util.stream.IntStream;
 import java.util.stream.Stream;
 import org.junit.jupiter.api.Test;
 import org.junit.jupiter.api.io.TempDir;
@@ -92,32 +90,21 @@ class ProcessTest {
                 "the worker was inside a host call and came out of it during the exit");
     }
 
-    /** Exit codes of the three ways a soak's JVM ends. */
-    static final Map<String, Integer> ENDINGS = Map.of("exit", 3, "end", 0, "throw", 1);
-
-    /** HOSTCALL_SOAK_EXITS runs; `make soak` raises it. */
+    /** HOSTCALL_SOAK_EXITS runs, two at a time; `make soak` raises it. */
     @Test
-    void Exit_AtRandomPointsOfASoak_EndsCleanlyEveryTime() throws Exception {
+    void Exit_AtRandomPointsOfASoak_EndsCleanlyEveryTime() {
         long base = System.nanoTime() % 100_000;
-        ExecutorService pair = Executors.newFixedThreadPool(2);
-        try {
-            List<Future<String>> outcomes = new ArrayList<>();
-            for (int i = 0; i < SoakTest.size("HOSTCALL_SOAK_EXITS", 12); i++) {
-                String how = List.of("exit", "end", "throw").get(i % 3);
-                String seed = Long.toString(base + i);
-                // A slow host that fails now and then; debug lines off.
-                Map<String, String> env = Map.of("VMSG_DEVICE_DELAY_JITTER_US", "40", "VMSG_DEVICE_FAIL_PER_MILLE",
-                        "20", "VMSG_DEVICE_RECORD", "0", "VMSG_DEVICE_SEED", seed, "HOSTCALL_PROPERTIES_FILE", "");
-                outcomes.add(pair.submit(() -> {
-                    ChildJvm child = ChildJvm.run(ENDINGS.get(how), ChildJvm.CLASS_PATH, env, "soak-exit", how, seed);
-                    assertEquals(1, child.reported("RESULT").size(), seed + " reached its end:\n" + child.output);
-                    return seed + " " + child.reported("RESULT").get(0) + " in " + child.elapsed.toMillis() + " ms";
-                }));
-            }
-            for (Future<String> outcome : outcomes) System.out.println(outcome.get());
-        } finally {
-            pair.shutdownNow();
-        }
+        IntStream.range(0, SoakTest.size("HOSTCALL_SOAK_EXITS", 12)).parallel().forEach(i -> {
+            String how = List.of("exit", "end", "throw").get(i % 3);
+            String seed = Long.toString(base + i);
+            // A slow host that fails now and then; debug lines off.
+            Map<String, String> env = Map.of("VMSG_DEVICE_DELAY_JITTER_US", "40", "VMSG_DEVICE_FAIL_PER_MILLE", "20",
+                    "VMSG_DEVICE_RECORD", "0", "VMSG_DEVICE_SEED", seed, "HOSTCALL_PROPERTIES_FILE", "");
+            ChildJvm child = ChildJvm.run(Map.of("exit", 3, "end", 0, "throw", 1).get(how), ChildJvm.CLASS_PATH, env,
+                    "soak-exit", how, seed);
+            assertEquals(1, child.reported("RESULT").size(), seed + " reached its end:\n" + child.output);
+            System.out.println(seed + " " + child.reported("RESULT").get(0) + " in " + child.elapsed.toMillis() + " ms");
+        });
     }
 
     @Test
