@@ -30,17 +30,6 @@ namespace {
 
 AndroidLogCapture* gCapture = nullptr;  // never destroyed: late lines arrive at exit
 
-jobjectArray toStringArray(JNIEnv* env, const std::vector<std::string>& items) {
-    jobjectArray array =
-        env->NewObjectArray(jsize(items.size()), env->FindClass("java/lang/String"), nullptr);
-    for (size_t i = 0; array != nullptr && i < items.size(); ++i) {
-        jstring item = env->NewStringUTF(items[i].c_str());
-        env->SetObjectArrayElement(array, jsize(i), item);
-        env->DeleteLocalRef(item);
-    }
-    return array;
-}
-
 // Holds exchanges of one operation inside the host until the process exits,
 // then lets them finish while the exit goes on.
 struct ExitGate {
@@ -94,11 +83,11 @@ TEST_NATIVE(void, startLogCapture)(JNIEnv*, jclass) {
     if (gCapture == nullptr) gCapture = new AndroidLogCapture();
 }
 
-TEST_NATIVE(jobjectArray, takeLogLines)(JNIEnv* env, jclass) {
-    std::vector<std::string> items;
+TEST_NATIVE(jstring, takeLogLines)(JNIEnv* env, jclass) {
+    std::string text;
     for (const AndroidLogLine& line : gCapture->take())
-        items.push_back(std::to_string(line.priority) + "|" + line.tag + "|" + line.text);
-    return toStringArray(env, items);
+        text += std::to_string(line.priority) + "|" + line.tag + "|" + line.text + '\1';
+    return env->NewStringUTF(text.c_str());
 }
 
 TEST_NATIVE(void, configureHost)
@@ -112,16 +101,16 @@ TEST_NATIVE(void, configureHost)
     vmsgDeviceConfigure(script);
 }
 
-TEST_NATIVE(jobjectArray, requests)(JNIEnv* env, jclass) {
-    std::vector<std::string> hex;
+TEST_NATIVE(jstring, requests)(JNIEnv* env, jclass) {
+    std::string hex;
     for (const VmsgDeviceExchange& exchange : vmsgDeviceExchanges()) {
-        std::string& text = hex.emplace_back();
         for (uint8_t byte : exchange.request) {
-            text += "0123456789abcdef"[byte >> 4];
-            text += "0123456789abcdef"[byte & 15];
+            hex += "0123456789abcdef"[byte >> 4];
+            hex += "0123456789abcdef"[byte & 15];
         }
+        hex += ' ';
     }
-    return toStringArray(env, hex);
+    return env->NewStringUTF(hex.c_str());
 }
 
 TEST_NATIVE(jint, overlaps)(JNIEnv*, jclass) { return jint(vmsgDeviceOverlapCount()); }

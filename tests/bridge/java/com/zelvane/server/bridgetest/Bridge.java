@@ -15,7 +15,6 @@ import java.util.Arrays;
 import java.util.Collections;
 import java.util.HexFormat;
 import java.util.List;
-import java.util.function.BooleanSupplier;
 
 /**
  * The library loaded into this JVM as the Android runtime loads it, with the
@@ -28,10 +27,9 @@ final class Bridge {
     static final String TAG = "KivHostCallService-JNI";
 
     /** The event whose delivery shows that every event queued before it has run. */
-    private static final int SENTINEL_SECS = -424242;
-    private static final String SENTINEL = request(42, SENTINEL_SECS);
-    private static final String SENTINEL_NAME = "setUsageStatsUpdateInterval(JNIEnv *, jobject, int)";
-    private static final String SENTINEL_RETURNING = debug(task("jint " + SENTINEL_NAME) + ": returning, rval = 0");
+    private static final String SENTINEL_NAME = "jint setUsageStatsUpdateInterval(JNIEnv *, jobject, int)";
+    private static final String SENTINEL = request(42, -424242);
+    private static final String SENTINEL_RETURNING = debug(task(SENTINEL_NAME) + ": returning, rval = 0");
 
     private static KivHostCallService service;
     /** Every captured line as "priority|tag|text", in order. */
@@ -52,17 +50,8 @@ final class Bridge {
 
     /** Loaded and started once for the whole JVM. */
     static synchronized KivHostCallService started() {
-        boolean first = service == null;
-        if (first) load().native_init();
+        if (service == null) load().native_init();
         return service;
-    }
-
-    static void await(String what, BooleanSupplier condition) {
-        long deadline = System.nanoTime() + WAIT.toNanos();
-        while (!condition.getAsBoolean()) {
-            assertTrue(System.nanoTime() < deadline, "timed out waiting for " + what);
-            Thread.yield();
-        }
     }
 
     static String debug(String text) {
@@ -79,7 +68,7 @@ final class Bridge {
     }
 
     static synchronized List<String> lines() {
-        LOG.addAll(Arrays.asList(TestNative.takeLogLines()));
+        for (String line : TestNative.takeLogLines().split("\u0001")) if (!line.isEmpty()) LOG.add(line);
         return new ArrayList<>(LOG);
     }
 
@@ -91,18 +80,29 @@ final class Bridge {
         return lines;
     }
 
+    /** Every request the host has received, as hex. */
+    static List<String> requests() {
+        List<String> hex = new ArrayList<>(Arrays.asList(TestNative.requests().split(" ")));
+        hex.remove("");
+        return hex;
+    }
+
     /**
      * Queues the sentinel and waits until the host has received it (and, with
      * debug lines on, until its task has logged). Returns the requests the
      * host has received before it, as hex.
      */
     static List<String> drain(KivHostCallService s, boolean debugOn) {
-        int sent = Collections.frequency(Arrays.asList(TestNative.requests()), SENTINEL);
+        int sent = Collections.frequency(requests(), SENTINEL);
         int logged = Collections.frequency(lines(), SENTINEL_RETURNING);
-        s.native_setUsageStatsUpdateInterval(SENTINEL_SECS);
-        await("the sentinel event", () -> Collections.frequency(Arrays.asList(TestNative.requests()), SENTINEL) > sent);
-        if (debugOn) await("its returning line", () -> Collections.frequency(lines(), SENTINEL_RETURNING) > logged);
-        List<String> received = new ArrayList<>(Arrays.asList(TestNative.requests()));
+        s.native_setUsageStatsUpdateInterval(-424242);
+        long deadline = System.nanoTime() + WAIT.toNanos();
+        while (Collections.frequency(requests(), SENTINEL) == sent
+                || debugOn && Collections.frequency(lines(), SENTINEL_RETURNING) == logged) {
+            assertTrue(System.nanoTime() < deadline, "timed out waiting for the sentinel event");
+            Thread.yield();
+        }
+        List<String> received = requests();
         received.removeAll(List.of(SENTINEL));
         return received;
     }
@@ -110,10 +110,9 @@ final class Bridge {
     /** The bridge's lines from index `from` on, less the sentinel's, after a drain. */
     static List<String> drainedLines(int from) {
         List<String> lines = bridgeLines(from);
-        lines.remove(debug("jint " + SENTINEL_NAME + ": secs = " + SENTINEL_SECS));
+        lines.remove(debug(SENTINEL_NAME + ": secs = -424242"));
         // The sentinel's task logs last; another task of its method may log the same text before.
-        int last = lines.lastIndexOf(SENTINEL_RETURNING);
-        if (last >= 0) lines.remove(last);
+        lines.remove(lines.lastIndexOf(SENTINEL_RETURNING));
         return lines;
     }
 
@@ -125,24 +124,19 @@ final class Bridge {
      */
     static String request(int op, Object... values) {
         ByteBuffer b = ByteBuffer.allocate(1 << 16).order(ByteOrder.LITTLE_ENDIAN).putInt(op).putInt(0);
-        for (Object value : values) {
-            if (value instanceof String text) {
-                byte[] utf = modifiedUtf8(text);
-                b.putInt(utf.length + 1).put(utf).put((byte) 0);
-            } else {
-                b.putInt(value instanceof Boolean yes ? (yes ? 1 : 0) : (Integer) value);
-            }
-        }
-        return HexFormat.of().formatHex(b.array(), 0, b.putInt(4, b.position()).position());
-    }
-
-    private static byte[] modifiedUtf8(String text) {
         try {
-            ByteArrayOutputStream bytes = new ByteArrayOutputStream();
-            new DataOutputStream(bytes).writeUTF(text);
-            return Arrays.copyOfRange(bytes.toByteArray(), 2, bytes.size());
+            for (Object value : values) {
+                if (value instanceof String text) {
+                    ByteArrayOutputStream utf = new ByteArrayOutputStream();
+                    new DataOutputStream(utf).writeUTF(text);
+                    b.putInt(utf.size() - 1).put(utf.toByteArray(), 2, utf.size() - 2).put((byte) 0);
+                } else {
+                    b.putInt(value instanceof Boolean yes ? (yes ? 1 : 0) : (Integer) value);
+                }
+            }
         } catch (IOException e) {
             throw new UncheckedIOException(e);
         }
+        return HexFormat.of().formatHex(b.array(), 0, b.putInt(4, b.position()).position());
     }
 }

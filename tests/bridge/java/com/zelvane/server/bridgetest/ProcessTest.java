@@ -179,7 +179,7 @@ class ProcessTest {
                 s.native_isAppLaunchAllowed("x"), s.native_setGoogleAdId("y")), "before the start");
         s.native_init();
         assertEquals(List.of(0, true, -1, 0), List.of(s.native_setClipboardText("late"), s.native_isAppLaunchAllowed("x"),
-                s.native_setGoogleAdId("y"), TestNative.requests().length), "after a failed start, nothing sent");
+                s.native_setGoogleAdId("y"), Bridge.requests().size()), "after a failed start, nothing sent");
         List<String> lines = Bridge.lines();
         lines.removeIf(l -> !l.contains("|" + Bridge.TAG + "|") && !l.contains("hcallLibInitGuest"));
         // No returning line, and the debug switch stays off.
@@ -231,7 +231,10 @@ class ProcessTest {
         for (int id : new int[] {0, 1, 2, SoakTest.PRODUCERS, SoakTest.PRODUCERS + 1}) {
             SoakTest.Sender sender = new SoakTest.Sender(seed, id);
             Thread thread = new Thread(() -> {
-                for (;;) sender.next().send(s);
+                for (;;) {
+                    sender.next();
+                    sender.send(s);
+                }
             });
             thread.setDaemon(true);
             thread.start();

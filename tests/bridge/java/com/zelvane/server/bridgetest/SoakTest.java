@@ -42,29 +42,14 @@ class SoakTest {
      */
     static final long RESIDENT_MARGIN = 24L << 20;
     static final long NATIVE_HEAP_MARGIN = 2L << 20;
-    /** An event's tag: "S<sender>#<seq>" in its strings, INT_TAG_BASE + sender * MAX_SEQ + seq in its ints. */
+    /** A call's tag: "S<sender>#<seq>" in its strings, INT_TAG_BASE + sender * MAX_SEQ + seq in its ints. */
     static final int MAX_SEQ = 10_000_000;
     static final int INT_TAG_BASE = 1_000_000_000;
-    static final Pattern TAG = Pattern.compile("S(\\d+)#(\\d+)|\\b(1\\d{9})\\b");
+    static final Pattern TAG = Pattern.compile("S(\\d+)#|\\b(1\\d{9})\\b");
 
     static int size(String variable, int fallback) {
         String value = System.getenv(variable);
         return value == null || value.isEmpty() ? fallback : Integer.parseInt(value);
-    }
-
-    /** One call: a method and its arguments. Untagged: nothing in it can carry a tag (no string, no int). */
-    record Event(Row row, Object[] args) {
-        Object send(KivHostCallService s) {
-            return row.call(s, args);
-        }
-
-        String request() {
-            return Bridge.request(row.op(), args);
-        }
-
-        boolean tagged() {
-            return Arrays.stream(args).anyMatch(a -> !(a instanceof Boolean));
-        }
     }
 
     /**
@@ -77,6 +62,8 @@ class SoakTest {
         final SplittableRandom random;
         final List<Row> rows;
         int seq;
+        Row row;
+        Object[] args;
 
         Sender(long seed, int id) {
             this.id = id;
@@ -84,19 +71,33 @@ class SoakTest {
             rows = MethodsTest.ROWS.stream().filter(r -> r.query() == id >= PRODUCERS).toList();
         }
 
-        /** Strings carry the tag, now and then with some length; ints carry it too; booleans are random. */
-        Event next() {
-            Row row = rows.get(random.nextInt(rows.size()));
-            Object[] args = row.args().clone();
+        /**
+         * Moves to the next call: strings carry the tag, now and then with
+         * some length, ints carry it too, booleans are random. Returns
+         * whether the call carries the tag (not when it has only booleans).
+         */
+        boolean next() {
+            row = rows.get(random.nextInt(rows.size()));
+            args = row.args().clone();
             String tag = "S" + id + "#" + seq;
+            boolean tagged = false;
             for (int i = 0; i < args.length; i++) {
+                tagged |= !(args[i] instanceof Boolean);
                 if (args[i] instanceof String)
                     args[i] = random.nextInt(4) == 0 ? tag + "~" + "x".repeat(random.nextInt(200)) : tag;
                 else if (args[i] instanceof Integer) args[i] = INT_TAG_BASE + id * MAX_SEQ + seq;
                 else args[i] = random.nextBoolean();
             }
             seq = (seq + 1) % MAX_SEQ;
-            return new Event(row, args);
+            return tagged;
+        }
+
+        Object send(KivHostCallService s) {
+            return row.call(s, args);
+        }
+
+        String request() {
+            return Bridge.request(row.op(), args);
         }
     }
 
@@ -147,8 +148,8 @@ class SoakTest {
                     for (int r = 0; r < ROUNDS; r++) {
                         barrier.await();
                         for (int i = 0; i < perRound(sender.id); i++) {
-                            Object result = sender.next().send(s);
-                            if (sender.id < PRODUCERS && !result.equals(0)) problem("a method refused an event");
+                            sender.next();
+                            if (!sender.send(s).equals(0) && sender.id < PRODUCERS) problem("an event refused");
                         }
                         barrier.await();
                     }
@@ -207,30 +208,28 @@ class SoakTest {
                 String request = part[0].substring("req=".length());
                 Matcher tag = TAG.matcher(part[2]);
                 int id = !tag.find() ? -1
-                        : tag.group(3) != null ? (Integer.parseInt(tag.group(3)) - INT_TAG_BASE) / MAX_SEQ
+                        : tag.group(2) != null ? (Integer.parseInt(tag.group(2)) - INT_TAG_BASE) / MAX_SEQ
                                                : Integer.parseInt(tag.group(1));
                 if (id < PRODUCERS && part[2].endsWith(" -> 0")) delivered++;
                 else if (id < PRODUCERS) failed++;
-                Event want = id < 0 ? null : next(replay[id], untagged);
                 if (id < 0) untagged.merge(request, -1, Integer::sum);
-                else if (want == null || !want.request().equals(request))
+                else if (!nextTagged(replay[id], untagged) || !replay[id].request().equals(request))
                     problem("S" + id + "#" + (replay[id].seq - 1) + " expected, the host got " + part[2]);
             }
         }
         for (Sender sender : replay)
-            for (Event e; (e = next(sender, untagged)) != null;) problem("never reached the host: " + e.request());
+            while (nextTagged(sender, untagged)) problem("never reached the host: " + sender.request());
         untagged.values().removeIf(left -> left == 0);
         if (!untagged.isEmpty()) problem("untagged calls sent less received: " + untagged);
     }
 
-    /** The sender's next tagged call that it sent, counting the untagged ones before it; null: none left. */
-    Event next(Sender sender, Map<String, Integer> untagged) {
+    /** Moves to the sender's next tagged call, counting the untagged ones before it; false: it sent no more. */
+    boolean nextTagged(Sender sender, Map<String, Integer> untagged) {
         while (sender.seq < ROUNDS * perRound(sender.id)) {
-            Event e = sender.next();
-            if (e.tagged()) return e;
-            untagged.merge(e.request(), 1, Integer::sum);
+            if (sender.next()) return true;
+            untagged.merge(sender.request(), 1, Integer::sum);
         }
-        return null;
+        return false;
     }
 
     synchronized void problem(String what) {

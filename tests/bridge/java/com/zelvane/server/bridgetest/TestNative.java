@@ -8,13 +8,13 @@ final class TestNative {
     private TestNative() {}
 
     static native void startLogCapture();
-    /** The lines captured since the last take, as "priority|tag|text"; the capture forgets them. */
-    static native String[] takeLogLines();
+    /** The lines captured since the last take, as "priority|tag|text" each ended by U+0001; the capture forgets them. */
+    static native String takeLogLines();
 
     /** A fresh host: default answers, records cleared; codeResults pairs an operation code with its result. */
     static native void configureHost(boolean launchAllowed, int[] codeResults);
-    /** Every request the host has received, as hex. */
-    static native String[] requests();
+    /** Every request the host has received, as hex, each ended by a blank. */
+    static native String requests();
     static native int overlaps();
     static native int openDevices();
     static native long served();
