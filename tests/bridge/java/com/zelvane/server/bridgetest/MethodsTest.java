@@ -143,13 +143,6 @@ class MethodsTest {
         assertEquals(0, TestNative.overlaps(), "host calls never overlap");
     }
 
-    @Test
-    void Queries_WhenTheHostSaysYes_ReturnItsAnswer() {
-        TestNative.configureHost(true, new int[0]);
-        assertEquals(true, s.native_isAppLaunchAllowed("q"), "launch allowed");
-        assertEquals(0, s.native_setGoogleAdId("ad"), "success reaches Java as 0");
-    }
-
     /**
      * Every string of every method, empty and then null. A checked one refuses
      * the call after its first line; an unchecked one travels empty. A null
