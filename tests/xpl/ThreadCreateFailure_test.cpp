@@ -19,7 +19,8 @@ namespace {
 
 // Regression: xthrPoolFini waited for every worker asked for, started or not,
 // and so never returned.
-TEST(ThreadCreateFailure, PoolInit_WhenCreationFailsPartWay_ReportsErrorAndFiniWaitsOnlyForStarted) {
+TEST(ThreadCreateFailure,
+     PoolInit_WhenCreationFailsPartWay_ReportsErrorAndFiniWaitsOnlyForStarted) {
     LogRecorder recorder;
     ThreadPool pool;
     {

@@ -125,7 +125,9 @@ TEST_F(XlogConfig, XplLibInit_StartsCodesThenLoggerAndStopsAtAFailure) {
             if (g_xlog->fileName != row.logFile) return "log file " + g_xlog->fileName;
             const bool filled = row.want == XERR_SUCCESS && !row.callersLogger;
             for (int module = 0; module < XLOG_NUM_MODULES; ++module) {
-                const int want = !filled ? 0 : module == XLOG_MODULE_XMEM ? XLOG_LEVEL_D : XLOG_LEVEL_I;
+                const int want = !filled                      ? 0
+                                 : module == XLOG_MODULE_XMEM ? XLOG_LEVEL_D
+                                                              : XLOG_LEVEL_I;
                 if (levelOf(module) != want) return "module " + std::to_string(module);
             }
             // Regression: unfilled tables were read through null level letters.

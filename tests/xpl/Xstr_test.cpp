@@ -8,7 +8,6 @@
 #include <string>
 #include <vector>
 
-
 namespace {
 
 TEST(Xstr, CaseInsensitiveCompare_FoldsAsciiLettersOnly) {

@@ -57,8 +57,8 @@ TEST(Xtimer, Start_RunsCallbacksByExpiryThenSchedulingOrderNeverEarly) {
         long long delay;
     } rows[] = {
         {"far", LLONG_MAX},  // saturates rather than wrapping round to the past
-        {"30ms", 30000},  {"10ms", 10000},     {"zero", 0},         {"20ms", 20000},
-        {"-5s", -5000000}, {"first", LLONG_MIN}, {"second", LLONG_MIN}, {"third", LLONG_MIN},
+        {"30ms", 30000},    {"10ms", 10000},      {"zero", 0},           {"20ms", 20000},
+        {"-5s", -5000000},  {"first", LLONG_MIN}, {"second", LLONG_MIN}, {"third", LLONG_MIN},
     };
     std::map<std::string, long long> earliest;
     for (const auto& row : rows) {
