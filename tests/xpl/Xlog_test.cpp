@@ -1,15 +1,13 @@
-// The logger core: the record as loaded, the should-log step, the default
-// print's Android sink, the fatal-error statement, and safety at exit.
+// The logger core: the record as loaded, the default print's Android sink,
+// the fatal-error statement.
 #include "xpl/Xlog.h"
 
 #include <android/log.h>
 #include <gtest/gtest.h>
 
-#include <atomic>
 #include <csignal>
 #include <cstdlib>
 #include <string>
-#include <thread>
 
 #include "support/AndroidLogCapture.h"
 #include "support/ChildProcess.h"
@@ -54,18 +52,6 @@ TEST(Xlog, Print_SendsTheMessageAsFormattedWithTheLevelsPriority) {
     }
 }
 
-TEST(Xlog, Statement_AsksModuleThenLevelAndEvaluatesOnlyWantedLines) {
-    LogRecorder recorder(XLOG_LEVEL_I);
-    recorder.clear();
-    int evaluated = 0;
-    XLOG_AT(XLOG_MODULE_XFILE, XLOG_LEVEL_D, "f", "g", "%d", ++evaluated);
-    XLOG_AT(XLOG_MODULE_XFILE, XLOG_LEVEL_I, "f", "g", "%d", ++evaluated);
-    EXPECT_EQ(recorder.texts(XLOG_MODULE_XFILE), std::vector<std::string>{"1"});
-    const std::vector<std::pair<int, int>> asked = {{XLOG_MODULE_XFILE, XLOG_LEVEL_D},
-                                                    {XLOG_MODULE_XFILE, XLOG_LEVEL_I}};
-    EXPECT_EQ(recorder.asked(), asked);
-}
-
 TEST(Xlog, Fatal_PrintsTheFatalLineThenBreaks) {
     ChildOutcome trapped = runInChild([] {
         XLOG_FATAL(XLOG_MODULE_XTHR, "f", "g", "h");
@@ -85,27 +71,6 @@ TEST(Xlog, Fatal_PrintsTheFatalLineThenBreaks) {
     });
     EXPECT_TRUE(ignored.exited && ignored.exitCode == 1)
         << "with SIGTRAP ignored the break exits with 1 (3: no fatal line); " << ignored.describe();
-}
-
-// The record and the kernel-log stream are never freed: a thread that logs
-// while the process exits must find both intact. Repeated: the window is narrow.
-TEST(Xlog, Exit_WhenAnotherThreadLogsMeanwhile_EndsCleanly) {
-    for (int round = 0; round < 20; ++round) {
-        ChildOutcome outcome = runInChild([] {
-            AndroidLogCapture capture;  // keeps standard error quiet
-            static std::atomic<bool> logging{false};
-            std::thread([] {
-                for (int i = 0;; ++i) {
-                    XLOG_AT(XLOG_MODULE_XTHR, XLOG_LEVEL_E, "f", "g", "late %d\n", i);
-                    logging.store(true);
-                }
-            }).detach();
-            while (!logging.load()) std::this_thread::yield();
-            std::exit(0);
-            return "";
-        });
-        ASSERT_TRUE(outcome.ok()) << "round " << round << ": " << outcome.describe();
-    }
 }
 
 }  // namespace

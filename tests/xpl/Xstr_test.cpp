@@ -8,8 +8,6 @@
 #include <string>
 #include <vector>
 
-#include "xpl/Xmem.h"
-
 namespace {
 
 TEST(Xstr, CaseInsensitiveCompare_FoldsAsciiLettersOnly) {
@@ -115,22 +113,6 @@ TEST(Xstr, Printf_HoldsTheWholeOutput) {
     const wchar_t notInCLocale[] = {0xE9, 0};
     ASSERT_LT(std::snprintf(nullptr, 0, "%ls", notInCLocale), 0) << "the C locale lacks U+00E9";
     EXPECT_EQ(xstrPrintf("%ls", notInCLocale), "");
-}
-
-TEST(Xstr, ArrayHelpers_ReturnTheirTargetAndKeepTheirBounds) {
-    char* copy = xstr_dup("abc");
-    EXPECT_EQ(std::string(copy, 4), std::string("abc", 4)) << "the copy has its terminator";
-    xmem_free(copy);
-    char buf[8];
-    EXPECT_EQ(xmem_set(buf, '#', sizeof(buf)), buf);
-    EXPECT_EQ(xstr_ncpy(buf, "abcdef", 3), buf);
-    EXPECT_EQ(std::string(buf, 4), "abc#") << "strncpy adds no terminator";
-    EXPECT_EQ(xmem_cpy(buf, "pq", 2), buf);
-    EXPECT_EQ(xstr_cpy(buf + 2, "x"), buf + 2);
-    EXPECT_EQ(xstr_snprintf(buf + 3, 4, "%d", 12345), 5) << "the length it wanted";
-    EXPECT_STREQ(buf, "pqx123");
-    int a = 0, b = 0;
-    EXPECT_EQ(xstr_sscanf("7 9", "%d %d", &a, &b) * 100 + a * 10 + b, 279);
 }
 
 }  // namespace

@@ -6,6 +6,8 @@
 // It does not link the service library: the tests load it first, so its
 // static objects are constructed before the library's and destroyed after
 // them, which is what the exit gate below relies on.
+#include <ScopedPrimitiveArray.h>
+#include <ScopedUtfChars.h>
 #include <dlfcn.h>
 #include <jni.h>
 #include <malloc.h>
@@ -14,6 +16,8 @@
 #include <chrono>
 #include <condition_variable>
 #include <cstring>
+#include <filesystem>
+#include <fstream>
 #include <mutex>
 #include <string>
 #include <thread>
@@ -25,24 +29,6 @@
 namespace {
 
 AndroidLogCapture* gCapture = nullptr;  // never destroyed: late lines arrive at exit
-
-jobjectArray toStringArray(JNIEnv* env, const std::vector<std::string>& items) {
-    jobjectArray array =
-        env->NewObjectArray(jsize(items.size()), env->FindClass("java/lang/String"), nullptr);
-    for (size_t i = 0; array != nullptr && i < items.size(); ++i) {
-        jstring item = env->NewStringUTF(items[i].c_str());
-        env->SetObjectArrayElement(array, jsize(i), item);
-        env->DeleteLocalRef(item);
-    }
-    return array;
-}
-
-jobjectArray toLineArray(JNIEnv* env, const std::vector<AndroidLogLine>& lines) {
-    std::vector<std::string> items;
-    for (const AndroidLogLine& line : lines)
-        items.push_back(std::to_string(line.priority) + "|" + line.tag + "|" + line.text);
-    return toStringArray(env, items);
-}
 
 // Holds exchanges of one operation inside the host until the process exits,
 // then lets them finish while the exit goes on.
@@ -88,29 +74,6 @@ struct StarvedRuntime {
 };
 StarvedRuntime* gStarved = nullptr;
 
-jboolean starvedExceptionCheck(JNIEnv*) { return gStarved->real->ExceptionCheck(); }
-const char* starvedGetStringUTFChars(JNIEnv*, jstring, jboolean*) { return nullptr; }
-void starvedReleaseStringUTFChars(JNIEnv*, jstring, const char*) { ++gStarved->releases; }
-
-using Conversion = std::string (*)(JNIEnv*, jobject, jstring);
-
-// The library's exported conversion, from the copy the test loaded.
-Conversion libraryConversion() {
-    void* library = dlopen("libhostcall_jni.so", RTLD_LAZY | RTLD_NOLOAD);
-    return library == nullptr
-               ? nullptr
-               : reinterpret_cast<Conversion>(dlsym(
-                     library, "_Z20getStringFromJstringB5cxx11P7_JNIEnvP8_jobjectP8_jstring"));
-}
-
-using AllocatedBytes = size_t (*)();
-
-// A sanitizer's allocator keeps its own books; glibc's otherwise.
-AllocatedBytes sanitizerAllocatedBytes() {
-    return reinterpret_cast<AllocatedBytes>(
-        dlsym(RTLD_DEFAULT, "__sanitizer_get_current_allocated_bytes"));
-}
-
 }  // namespace
 
 #define TEST_NATIVE(type, name) \
@@ -120,12 +83,11 @@ TEST_NATIVE(void, startLogCapture)(JNIEnv*, jclass) {
     if (gCapture == nullptr) gCapture = new AndroidLogCapture();
 }
 
-TEST_NATIVE(jobjectArray, logLines)(JNIEnv* env, jclass) {
-    return toLineArray(env, gCapture->lines());
-}
-
-TEST_NATIVE(jobjectArray, takeLogLines)(JNIEnv* env, jclass) {
-    return toLineArray(env, gCapture->take());
+TEST_NATIVE(jstring, takeLogLines)(JNIEnv* env, jclass) {
+    std::string text;
+    for (const AndroidLogLine& line : gCapture->take())
+        text += std::to_string(line.priority) + "|" + line.tag + "|" + line.text + '\1';
+    return env->NewStringUTF(text.c_str());
 }
 
 TEST_NATIVE(void, configureHost)
@@ -133,47 +95,22 @@ TEST_NATIVE(void, configureHost)
     vmsgDeviceReset();
     VmsgDeviceScript script;
     script.launchAllowed = launchAllowed != JNI_FALSE;
-    std::vector<jint> pairs(size_t(env->GetArrayLength(codeResults)));
-    env->GetIntArrayRegion(codeResults, 0, jsize(pairs.size()), pairs.data());
+    ScopedIntArrayRO pairs(env, codeResults);
     for (size_t i = 0; i + 1 < pairs.size(); i += 2)
         script.results[uint32_t(pairs[i])] = pairs[i + 1];
     vmsgDeviceConfigure(script);
 }
 
-// A slow host that fails now and then, keeping nothing in memory; one line per
-// exchange in tracePath (null: the trace is closed).
-TEST_NATIVE(void, configureSoakHost)
-(JNIEnv* env, jclass, jint jitterUs, jint failurePerMille, jlong seed, jstring tracePath) {
-    VmsgDeviceScript script;
-    script.record = false;
-    script.delayJitterUs = uint32_t(jitterUs);
-    script.failurePerMille = uint32_t(failurePerMille);
-    script.randomSeed = uint64_t(seed);
-    if (tracePath != nullptr) {
-        const char* path = env->GetStringUTFChars(tracePath, nullptr);
-        script.tracePath = path;
-        env->ReleaseStringUTFChars(tracePath, path);
-    }
-    vmsgDeviceConfigure(script);
-}
-
-TEST_NATIVE(void, setOpenErrno)(JNIEnv*, jclass, jint error) {
-    VmsgDeviceScript script = vmsgDeviceScript();
-    script.openErrno = error;
-    vmsgDeviceConfigure(script);
-}
-
-TEST_NATIVE(jobjectArray, requests)(JNIEnv* env, jclass) {
-    std::vector<std::string> hex;
+TEST_NATIVE(jstring, requests)(JNIEnv* env, jclass) {
+    std::string hex;
     for (const VmsgDeviceExchange& exchange : vmsgDeviceExchanges()) {
-        std::string& text = hex.emplace_back();
         for (uint8_t byte : exchange.request) {
-            static constexpr char kDigits[] = "0123456789abcdef";
-            text += kDigits[byte >> 4];
-            text += kDigits[byte & 15];
+            hex += "0123456789abcdef"[byte >> 4];
+            hex += "0123456789abcdef"[byte & 15];
         }
+        hex += ' ';
     }
-    return toStringArray(env, hex);
+    return env->NewStringUTF(hex.c_str());
 }
 
 TEST_NATIVE(jint, overlaps)(JNIEnv*, jclass) { return jint(vmsgDeviceOverlapCount()); }
@@ -184,13 +121,23 @@ TEST_NATIVE(jboolean, awaitServed)(JNIEnv*, jclass, jlong count, jlong timeoutMs
     return vmsgDeviceWaitForServed(uint64_t(count), uint32_t(timeoutMs)) ? JNI_TRUE : JNI_FALSE;
 }
 
+// Threads of this process named `name`: a thread inherits its creator's name.
+TEST_NATIVE(jint, threadsNamed)(JNIEnv* env, jclass, jstring name) {
+    ScopedUtfChars wanted(env, name);
+    jint count = 0;
+    for (const auto& task : std::filesystem::directory_iterator("/proc/self/task")) {
+        std::ifstream comm(task.path() / "comm");
+        std::string line;
+        count += std::getline(comm, line) && line == wanted.c_str();  // not when it ended meanwhile
+    }
+    return count;
+}
+
 // Loads `path` for good, so that the JVM's own unloading of it after a failed
 // JNI_OnLoad leaves it mapped: the JVM logs the library's name after it has
 // unloaded it, a read of freed memory that AddressSanitizer stops on.
 TEST_NATIVE(void, keepLoaded)(JNIEnv* env, jclass, jstring path) {
-    const char* chars = env->GetStringUTFChars(path, nullptr);
-    (void)dlopen(chars, RTLD_LAZY);
-    env->ReleaseStringUTFChars(path, chars);
+    (void)dlopen(ScopedUtfChars(env, path).c_str(), RTLD_LAZY);
 }
 
 TEST_NATIVE(void, holdUntilExit)(JNIEnv*, jclass, jint opCode) {
@@ -215,13 +162,19 @@ TEST_NATIVE(jboolean, awaitHeld)(JNIEnv*, jclass, jlong timeoutMs) {
 // {bytes converted, releases} of converting `s` through a runtime whose
 // GetStringUTFChars lends nothing; -1 bytes when the library is not loaded.
 TEST_NATIVE(jintArray, convertStarved)(JNIEnv* env, jclass, jstring s) {
-    Conversion convert = libraryConversion();
-    StarvedRuntime starved;
-    starved.real = env;
-    std::memcpy(&starved.functions, env->functions, sizeof(JNINativeInterface));
-    starved.functions.ExceptionCheck = starvedExceptionCheck;
-    starved.functions.GetStringUTFChars = starvedGetStringUTFChars;
-    starved.functions.ReleaseStringUTFChars = starvedReleaseStringUTFChars;
+    using Conversion = std::string (*)(JNIEnv*, jobject, jstring);
+    void* library = dlopen("libhostcall_jni.so", RTLD_LAZY | RTLD_NOLOAD);
+    auto convert = reinterpret_cast<Conversion>(
+        library ? dlsym(library, "_Z20getStringFromJstringB5cxx11P7_JNIEnvP8_jobjectP8_jstring")
+                : nullptr);
+    StarvedRuntime starved{env, *env->functions, {}};
+    starved.functions.ExceptionCheck = [](JNIEnv*) { return gStarved->real->ExceptionCheck(); };
+    starved.functions.GetStringUTFChars = [](JNIEnv*, jstring, jboolean*) -> const char* {
+        return nullptr;
+    };
+    starved.functions.ReleaseStringUTFChars = [](JNIEnv*, jstring, const char*) {
+        ++gStarved->releases;
+    };
     starved.env.functions = &starved.functions;
     gStarved = &starved;
     jint counts[2] = {convert ? jint(convert(&starved.env, nullptr, s).size()) : -1, 0};
@@ -235,7 +188,10 @@ TEST_NATIVE(jintArray, convertStarved)(JNIEnv* env, jclass, jstring s) {
 // Bytes the native allocator has handed out and not taken back; a sanitizer's
 // allocator keeps freed blocks in quarantine, so only its own count is fair.
 TEST_NATIVE(jlong, nativeHeapInUse)(JNIEnv*, jclass) {
-    if (AllocatedBytes allocated = sanitizerAllocatedBytes()) return jlong(allocated());
+    using AllocatedBytes = size_t (*)();
+    if (auto allocated = reinterpret_cast<AllocatedBytes>(
+            dlsym(RTLD_DEFAULT, "__sanitizer_get_current_allocated_bytes")))
+        return jlong(allocated());
     const struct mallinfo2 info = mallinfo2();
     return jlong(info.uordblks + info.hblkhd);
 }

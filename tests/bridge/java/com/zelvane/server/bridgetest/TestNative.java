@@ -7,23 +7,19 @@ package com.zelvane.server.bridgetest;
 final class TestNative {
     private TestNative() {}
 
-    /** Every captured Android log line as "priority|tag|text". */
     static native void startLogCapture();
-    static native String[] logLines();
-    /** The lines captured since the last take, which the capture then forgets. */
-    static native String[] takeLogLines();
+    /** The lines captured since the last take, as "priority|tag|text" each ended by U+0001; the capture forgets them. */
+    static native String takeLogLines();
 
     /** A fresh host: default answers, records cleared; codeResults pairs an operation code with its result. */
     static native void configureHost(boolean launchAllowed, int[] codeResults);
-    /** A slow host failing now and then, recording nothing but a trace line per exchange (null: no trace). */
-    static native void configureSoakHost(int jitterUs, int failurePerMille, long seed, String tracePath);
-    static native void setOpenErrno(int error);
-    /** Every request the host has received, as hex. */
-    static native String[] requests();
+    /** Every request the host has received, as hex, each ended by a blank. */
+    static native String requests();
     static native int overlaps();
     static native int openDevices();
     static native long served();
     static native boolean awaitServed(long count, long timeoutMs);
+    static native int threadsNamed(String name);
 
     /** Keeps the library at `path` loaded whatever the JVM unloads. */
     static native void keepLoaded(String path);
