@@ -54,13 +54,13 @@ fuzz: deps
 	cmake --build build-fuzz -j $(JOBS) --target hostcall_fuzz
 	fuzz/run-fuzz.sh build-fuzz $(FUZZ_SECONDS)
 
-# The shipped library as the platform build takes it: Android.bp parses, is
-# formatted and lists the CMake sources; clang's thread-safety analysis and
-# clang-tidy run clean over the library.
+# The platform build file parses, is formatted and lists, module for target,
+# the sources CMake builds; clang's thread-safety analysis and clang-tidy run
+# clean over the library.
 lint: deps
-	tools/lint/check-android-bp.sh
-	tools/lint/check-thread-safety.sh
 	cmake -S . -B build -DCMAKE_EXPORT_COMPILE_COMMANDS=ON $(CMAKE_FLAGS)
+	tools/lint/check-android-bp.sh . build
+	tools/lint/check-thread-safety.sh
 	tools/lint/run-clang-tidy.sh build $(JOBS)
 
 clean:

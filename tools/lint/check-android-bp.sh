@@ -1,17 +1,15 @@
 #!/usr/bin/env bash
 # Checks the Android build file: it parses, it is formatted as bpfmt writes it,
-# and each module's sources are exactly those of its CMake archives (for
-# libhostcall_jni, the four the CMake build whole-archives into
-# libhostcall_jni.so), so the two builds cannot drift apart.
-# Usage: check-android-bp.sh [REPO_ROOT]
+# and each module lists exactly the sources of its CMake target, as the CMake
+# configure step records them in BUILD_DIR/android-bp-sources.txt (one module
+# per line: its name, then its sources). A module either build has and the
+# other lacks is an error too, so the two builds cannot drift apart.
+# Usage: check-android-bp.sh [REPO_ROOT [BUILD_DIR]]
 set -euo pipefail
 root=${1:-$(cd "$(dirname "$0")/../.." && pwd)}
+manifest=${2:-$root/build}/android-bp-sources.txt
 bp=$root/Android.bp
-# Android.bp module: the folders of its CMake archives.
-declare -A modules=(
-    [libhostcall_jni]="Source/xpl Source/vmsg/guest Source/hcall/guest server/native"
-    [libhcall_host]="Source/hcall/host"
-)
+[[ -f $manifest ]] || { echo "$manifest missing: configure the CMake build first"; exit 1; }
 
 status=0
 # bpfmt exits nonzero on a parse error and prints a diff when the layout differs.
@@ -25,45 +23,31 @@ if [[ -n "$layout" ]]; then
     status=1
 fi
 
-# The .cpp entries of each archive's add_library(... STATIC ...) list and of
-# any target_sources(...), with the folder in front.
-cmake_sources() {
-    local dir
-    for dir in $1; do
-        awk -v dir="$dir" '
-            /add_library\([A-Za-z_]+ STATIC|target_sources\(/ { inlist = 1 }
-            inlist {
-                for (i = 1; i <= NF; i++)
-                    if ($i ~ /\.cpp\)?$/) { f = $i; sub(/\)$/, "", f); print dir "/" f }
-            }
-            inlist && /\)/ { inlist = 0 }' "$root/$dir/CMakeLists.txt"
-    done
-}
-
-# The quoted entries of one module's srcs list; bpfmt has put one on each line.
-bp_sources() {
-    awk -v module="$1" '
+# Every module with a srcs list, in the manifest's form; bpfmt writes a list
+# on one line or one quoted entry on each line.
+bp_modules() {
+    awk '
+        function quoted(line, q, n, i) {
+            n = split(line, q, "\"")
+            for (i = 2; i < n; i += 2) files = files " " q[i]
+        }
         /^[a-z_]+ \{/ { name = "" }
         /^    name: "/ { split($0, q, "\""); name = q[2] }
-        name == module && /^[[:space:]]*srcs: \[/ { inlist = 1; next }
-        inlist && /^[[:space:]]*\],/ { inlist = 0 }
-        inlist && /"/ { split($0, q, "\""); print q[2] }' "$bp"
+        name != "" && /^    srcs: \[.*\],$/ { files = ""; quoted($0); print name files; next }
+        name != "" && /^    srcs: \[/ { inlist = 1; files = ""; next }
+        inlist && /^    \],/ { inlist = 0; print name files }
+        inlist && /"/ { quoted($0) }' "$bp"
 }
+normalise() { while read -r module files; do
+    echo "$module $(tr ' ' '\n' <<<"$files" | sort | xargs)"
+done | sort; }
 
-total=0
-for module in "${!modules[@]}"; do
-    expected=$(cmake_sources "${modules[$module]}" | sort)
-    actual=$(bp_sources "$module" | sort)
-    if [[ -z "$expected" ]]; then
-        echo "$module: no sources found in its archives' CMakeLists.txt"
-        exit 1
-    fi
-    if [[ "$expected" != "$actual" ]]; then
-        echo "$module: Android.bp srcs differ from CMake (< CMake, > Android.bp):"
-        diff <(echo "$expected") <(echo "$actual") || true
-        status=1
-    fi
-    total=$((total + $(echo "$expected" | wc -l)))
-done
-[[ $status -eq 0 ]] && echo "Android.bp: formatted, ${#modules[@]} modules, $total sources as in CMake"
+expected=$(normalise <"$manifest")
+actual=$(bp_modules | normalise)
+if [[ "$expected" != "$actual" ]]; then
+    echo "Android.bp modules differ from CMake (< CMake, > Android.bp):"
+    diff <(echo "$expected") <(echo "$actual") || true
+    status=1
+fi
+[[ $status -eq 0 ]] && echo "Android.bp: formatted, $(wc -l <<<"$expected") modules with the sources of CMake"
 exit $status
