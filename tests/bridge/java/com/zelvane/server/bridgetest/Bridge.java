@@ -51,13 +51,9 @@ final class Bridge {
         return service;
     }
 
-    static String debug(String text) {
-        return "3|" + TAG + "|" + text;
-    }
+    static String debug(String text) { return "3|" + TAG + "|" + text; }
 
-    static String error(String text) {
-        return "6|" + TAG + "|" + text;
-    }
+    static String error(String text) { return "6|" + TAG + "|" + text; }
 
     /** The name a method's task logs under. */
     static String task(String name) {

@@ -181,12 +181,7 @@ class ProcessTest {
         long initAtMs = random.nextLong(100), endAtMs = random.nextLong(400);
         for (int id : new int[] {0, 1, 2, SoakTest.PRODUCERS, SoakTest.PRODUCERS + 1}) {
             SoakTest.Sender sender = new SoakTest.Sender(seed, id);
-            Thread thread = new Thread(() -> {
-                for (;;) {
-                    sender.next();
-                    sender.send(s);
-                }
-            });
+            Thread thread = new Thread(() -> { for (;;) sender.send(s); });
             thread.setDaemon(true);
             thread.start();
         }
@@ -196,8 +191,7 @@ class ProcessTest {
             s.native_init();
         }
         Thread.sleep(Math.max(0, endAtMs - (System.nanoTime() - started) / 1_000_000));
-        System.out.println("ending: " + how + " initAtMs=" + (initAtMs < endAtMs ? initAtMs : "never") + " endAtMs="
-                + endAtMs + " served=" + served());
+        System.out.println("ending: " + how + " initAtMs=" + (initAtMs < endAtMs ? initAtMs : "never") + " endAtMs=" + endAtMs);
         System.out.flush();
         if (how.equals("exit")) System.exit(3);
         if (how.equals("throw")) throw new IllegalStateException("the soak ends with an uncaught exception");
