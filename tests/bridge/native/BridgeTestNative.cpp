@@ -10,17 +10,16 @@
 
 #include <chrono>
 #include <condition_variable>
-#include <cstring>
 #include <mutex>
 #include <string>
-#include <thread>
 
 #include "VmsgDeviceModel.h"
 #include "support/AndroidLogCapture.h"
 
 namespace {
 
-AndroidLogCapture* gCapture = nullptr;  // never destroyed: late lines arrive at exit
+// From before the library's JNI_OnLoad; never destroyed: lines arrive at exit.
+AndroidLogCapture* const gCapture = new AndroidLogCapture();
 
 // Holds host calls of one operation until the process exits, after the
 // library's static destructors; never destroyed, the worker uses it at exit.
@@ -41,12 +40,12 @@ struct OpenAtExit {
             gGate->open = true;
             gGate->changed.notify_all();
         }
-        std::this_thread::sleep_for(std::chrono::milliseconds(300));  // the worker's grace
+        usleep(300 * 1000);  // the released worker's grace
         std::lock_guard<std::mutex> lock(gGate->mutex);
         // Straight to the descriptor: stdio may already be shut down.
-        const char* line =
-            gGate->left ? "RESULT workerLeftHost=true\n" : "RESULT workerLeftHost=false\n";
-        (void)!write(STDOUT_FILENO, line, strlen(line));
+        const std::string line =
+            std::string("RESULT workerLeftHost=") + (gGate->left ? "true\n" : "false\n");
+        (void)!write(STDOUT_FILENO, line.data(), line.size());
     }
 } gOpenAtExit;
 
@@ -63,10 +62,6 @@ StarvedRuntime* gStarved = nullptr;
 
 #define TEST_NATIVE(type, name) \
     extern "C" JNIEXPORT type JNICALL Java_com_zelvane_server_bridgetest_Bridge_##name
-
-TEST_NATIVE(void, startLogCapture)(JNIEnv*, jclass) {
-    if (gCapture == nullptr) gCapture = new AndroidLogCapture();
-}
 
 TEST_NATIVE(jstring, takeLogLines)(JNIEnv* env, jclass) {
     std::string text;

@@ -8,7 +8,7 @@ import java.nio.*;
 import java.time.Duration;
 import java.util.*;
 
-/** The library loaded as the Android runtime loads it, after libbridge_test_native.so: log capture and host. */
+/** The library loaded as the Android runtime loads it, after libbridge_test_native.so (log capture, host). */
 final class Bridge {
     static final Duration WAIT = Duration.ofSeconds(30);
     static final String TAG = "KivHostCallService-JNI";
@@ -21,7 +21,6 @@ final class Bridge {
 
     private Bridge() {}
 
-    static native void startLogCapture();
     static native String takeLogLines();  // each ended by U+0001; the capture forgets them
     static native void configureHost(boolean launchAllowed, int[] codeResults);  // a fresh host; code, result pairs
     static native String exchanges();  // the requests as hex, each ended by a blank
@@ -39,7 +38,6 @@ final class Bridge {
     static synchronized KivHostCallService load() {
         if (service == null) {
             System.load(System.getProperty("hostcall.testlib"));
-            startLogCapture();
             System.load(System.getProperty("hostcall.lib"));
             service = new KivHostCallService();
         }

@@ -168,7 +168,6 @@ class ProcessTest {
 
     static void noService() {
         System.load(System.getProperty("hostcall.testlib"));
-        startLogCapture();
         keepLoaded(System.getProperty("hostcall.lib"));
         assertThrows(UnsatisfiedLinkError.class, () -> System.load(System.getProperty("hostcall.lib")), "JNI_OnLoad -1");
         assertEquals(List.of(ON_LOAD, error("ERROR: KivHostCallService native registration failed")), bridgeLines(0));
