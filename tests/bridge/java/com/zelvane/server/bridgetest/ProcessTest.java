@@ -1,49 +1,33 @@
 package com.zelvane.server.bridgetest;
 
-import static com.zelvane.server.bridgetest.Bridge.debug;
-import static com.zelvane.server.bridgetest.Bridge.error;
-import static com.zelvane.server.bridgetest.Bridge.request;
-import static com.zelvane.server.bridgetest.Bridge.task;
-import static org.junit.jupiter.api.Assertions.assertEquals;
-import static org.junit.jupiter.api.Assertions.assertFalse;
-import static org.junit.jupiter.api.Assertions.assertThrows;
-import static org.junit.jupiter.api.Assertions.assertTrue;
+import static com.zelvane.server.bridgetest.Bridge.*;
+import static org.junit.jupiter.api.Assertions.*;
 
 import com.zelvane.server.KivHostCallService;
 import com.zelvane.server.bridgetest.MethodsTest.Row;
 import java.io.File;
-import java.nio.charset.StandardCharsets;
-import java.nio.file.Files;
-import java.nio.file.Path;
-import java.util.ArrayList;
-import java.util.List;
-import java.util.Map;
-import java.util.SplittableRandom;
+import java.nio.file.*;
+import java.util.*;
 import java.util.concurrent.TimeUnit;
-import java.util.stream.IntStream;
-import java.util.stream.Stream;
+import java.util.stream.*;
 import org.junit.jupiter.api.Test;
 import org.junit.jupiter.api.io.TempDir;
 import org.junit.jupiter.params.ParameterizedTest;
 import org.junit.jupiter.params.provider.ValueSource;
 
-/**
- * Loading, starting, the debug switch and the exit, each in a JVM of its own
- * (this JVM's -Xcheck:jni, preloads and properties) that runs a scenario of
- * {@link #main}, which checks itself: a broken expectation ends it with 1.
- */
+/** Loading, starting, the debug switch and the exit, each a scenario of {@link #main} in a JVM of its own. */
 class ProcessTest {
-    static final String ON_LOAD = "4|" + Bridge.TAG + "|jint JNI_OnLoad(JavaVM *, void *) called";
+    static final String ON_LOAD = "4|" + TAG + "|jint JNI_OnLoad(JavaVM *, void *) called";
     static final String INIT = "void native_init(JNIEnv *, jobject)";
     static final String CLASS_PATH = System.getProperty("java.class.path");
 
-    /** Runs the scenario `args` with `classPath` and `env`; checks that it ended with `exitCode`, uncomplaining. */
+    /** Runs scenario `args` in a JVM like this one; checks its exit code and that nothing complained. */
     static String run(int exitCode, String classPath, Map<String, String> env, String... args) throws Exception {
         List<String> command = new ArrayList<>(List.of(ProcessHandle.current().info().command().orElse("java"),
-                "-Xcheck:jni", "-Xmx64m", "-XX:ErrorFile=" + System.getProperty("java.io.tmpdir") + "/hs_err_%p.log"));
-        for (String property : List.of("hostcall.lib", "hostcall.testlib"))
-            command.add("-D" + property + "=" + System.getProperty(property));
-        command.addAll(List.of("-cp", classPath, ProcessTest.class.getName()));
+                "-Xcheck:jni", "-Xmx64m", "-XX:ErrorFile=" + System.getProperty("java.io.tmpdir") + "/hs_err_%p.log",
+                "-Dhostcall.lib=" + System.getProperty("hostcall.lib"),
+                "-Dhostcall.testlib=" + System.getProperty("hostcall.testlib"), "-cp", classPath,
+                ProcessTest.class.getName()));
         command.addAll(List.of(args));
         Path log = Files.createTempFile("bridge-child-", ".out");
         ProcessBuilder builder = new ProcessBuilder(command).redirectErrorStream(true).redirectOutput(log.toFile());
@@ -51,9 +35,8 @@ class ProcessTest {
         Process process = builder.start();
         boolean ended = process.waitFor(60, TimeUnit.SECONDS);  // far beyond any scenario
         if (!ended) process.destroyForcibly().waitFor();
-        String output = Files.readString(log, StandardCharsets.UTF_8);
+        String output = Files.readString(log), scenario = String.join(" ", args);
         Files.delete(log);
-        String scenario = String.join(" ", args);
         assertTrue(ended, scenario + " hung:\n" + output);
         assertEquals(exitCode, process.exitValue(), scenario + " exit code:\n" + output);
         for (String sign : List.of("WARNING in native method", "FATAL ERROR in native method", "SIGSEGV", "SIGABRT",
@@ -74,10 +57,7 @@ class ProcessTest {
         run(0, CLASS_PATH, Map.of("VMSG_DEVICE_FAIL", "open"), "start");
     }
 
-    /**
-     * Fault: the process could crash at exit when the connection was unmapped
-     * under an exchange in progress, or the pool destroyed under its worker.
-     */
+    /** Fault: the exit unmapped the connection under an exchange, or destroyed the pool under its worker. */
     @ParameterizedTest
     @ValueSource(strings = {"exit", "end"})
     void Exit_WhileTheWorkerIsInsideAHostCall_EndsCleanly(String how) throws Exception {
@@ -85,14 +65,12 @@ class ProcessTest {
         assertTrue(output.contains("workerLeftHost=true"), "the held call came back during the exit:\n" + output);
     }
 
-    /** HOSTCALL_SOAK_EXITS runs, two at a time; `make soak` raises it. */
+    /** HOSTCALL_SOAK_EXITS runs, two at a time, against a slow host that fails now and then; debug lines off. */
     @Test
     void Exit_AtRandomPointsOfASoak_EndsCleanlyEveryTime() {
         long base = System.nanoTime() % 100_000;
         IntStream.range(0, SoakTest.size("HOSTCALL_SOAK_EXITS", 12)).parallel().forEach(i -> {
-            String how = List.of("exit", "end", "throw").get(i % 3);
-            String seed = Long.toString(base + i);
-            // A slow host that fails now and then; debug lines off.
+            String how = List.of("exit", "end", "throw").get(i % 3), seed = Long.toString(base + i);
             Map<String, String> env = Map.of("VMSG_DEVICE_DELAY_JITTER_US", "40", "VMSG_DEVICE_FAIL_PER_MILLE", "20",
                     "VMSG_DEVICE_RECORD", "0", "VMSG_DEVICE_SEED", seed, "HOSTCALL_PROPERTIES_FILE", "");
             try {
@@ -123,121 +101,86 @@ class ProcessTest {
         }
     }
 
-    /** Calls native_init on a thread of its own and counts the threads it started: they inherit its name. */
-    static long threadsStartedByInit(KivHostCallService s, String name) throws Exception {
-        long[] started = new long[1];
-        Thread thread = new Thread(() -> {
-            s.native_init();
-            started[0] = TestNative.threadsNamed(name) - 1;  // less this one
-        }, name);
-        thread.start();
-        thread.join();
-        return started[0];
-    }
-
     /**
-     * With the property unset every method is called once: only the lines
-     * written whatever the switch says appear. Then native_init again with
-     * values that must leave the switch off, `onValue`, then 0: the switch
-     * turns on and stays on; a repeated start starts no worker and opens no
-     * connection.
+     * With the property unset, only the lines written whatever the switch says. Then starts again with values that
+     * leave the switch off, `onValue`, then 0: it turns on and stays on; no connection is added.
      */
     static void debugSwitch(String onValue) throws Exception {
         Path properties = Path.of(System.getenv("HOSTCALL_PROPERTIES_FILE"));
         Files.writeString(properties, "other.key=1\n");
-        KivHostCallService s = Bridge.load();
-        // Every forwarded call fails but the drain's.
+        KivHostCallService s = load();
+        // Every forwarded call fails but the drain's; launches are allowed, so the host's answers reach Java.
         List<Row> failing = MethodsTest.ROWS.stream().filter(r -> !r.query() && r.op() != 42).toList();
-        TestNative.configureHost(true, failing.stream().flatMapToInt(r -> IntStream.of(r.op(), -5)).toArray());
-        assertEquals(1, threadsStartedByInit(s, "hc-init"), "workers from the first start");
-        // The host allows launches: its answers reach Java.
+        configureHost(true, failing.stream().flatMapToInt(r -> IntStream.of(r.op(), -5)).toArray());
+        s.native_init();
         for (Row row : MethodsTest.ROWS)
             assertEquals(row.op() == 24 ? true : 0, row.call(s, row.args()), row.function() + " returns");
-        Bridge.drain(s, false);
+        drain(s, false);
         List<String> expected = new ArrayList<>(List.of(ON_LOAD, debug(INIT + ": called"),
                 debug(INIT + ": returning, rval = 0"), debug("jint onVibrate(JNIEnv *, jobject, jint, jstring) called")));
         failing.forEach(r -> expected.add(error("RPC failed for " + task(r.name()) + ", error -5")));
-        List<String> lines = Bridge.bridgeLines(0);
+        List<String> lines = bridgeLines(0);
         assertEquals(expected.subList(0, 3), lines.subList(0, 3), "entry and start lines first");
         assertEquals(expected.stream().sorted().toList(), lines.stream().sorted().toList(), "with the switch off");
         List<String> values = List.of("0", "", "abc", "-0", onValue, "0");
         for (int i = 0; i < values.size(); i++) {
             Files.writeString(properties, "kiv.debug.kivhostcall=" + values.get(i) + "\n");
-            assertEquals(0, threadsStartedByInit(s, "hc-init-" + i), "workers from a repeated start");
-            int mark = Bridge.lines().size();
+            s.native_init();
+            int mark = lines().size();
             s.native_onOrientationChange(i);
             String detail = debug("jint onOrientationChanged(JNIEnv *, jobject, int): orientation = " + i);
-            assertEquals(i >= 4, Bridge.bridgeLines(mark).contains(detail), "switch on after '" + values.get(i) + "'");
+            assertEquals(i >= 4, bridgeLines(mark).contains(detail), "switch on after '" + values.get(i) + "'");
         }
-        assertEquals(1, TestNative.openDevices(), "connections");
-        String alreadyStarted = "4|" + Bridge.TAG + "|" + INIT + ": service already started";
-        assertEquals(6, Bridge.lines().stream().filter(alreadyStarted::equals).count());
+        assertEquals(1, openDevices(), "connections");
+        assertEquals(6, lines().stream().filter(("4|" + TAG + "|" + INIT + ": service already started")::equals).count());
     }
 
     /** Events and queries before native_init, a start that cannot open the device, and a second start that can. */
     static void start() {
-        KivHostCallService s = Bridge.load();
+        KivHostCallService s = load();
         assertEquals(List.of(0, 0, true, -1), List.of(s.native_onLocaleChanged("en-US"), s.native_onOrientationChange(1),
                 s.native_isAppLaunchAllowed("x"), s.native_setGoogleAdId("y")), "before the start");
         s.native_init();
         assertEquals(List.of(0, true, -1, 0), List.of(s.native_setClipboardText("late"), s.native_isAppLaunchAllowed("x"),
-                s.native_setGoogleAdId("y"), Bridge.requests().size()), "after a failed start, nothing sent");
-        List<String> lines = Bridge.lines();
-        lines.removeIf(l -> !l.contains("|" + Bridge.TAG + "|") && !l.contains("hcallLibInitGuest"));
+                s.native_setGoogleAdId("y"), requests().size()), "after a failed start, nothing sent");
+        List<String> lines = lines();
+        lines.removeIf(l -> !l.contains("|" + TAG + "|") && !l.contains("hcallLibInitGuest"));
         // No returning line, and the debug switch stays off.
         assertEquals(List.of(ON_LOAD, debug(INIT + ": called")), lines.subList(0, 2), String.join("\n", lines));
         assertEquals(3, lines.size(), String.join("\n", lines));
         assertTrue(lines.get(2).matches("6\\|HCALL\\|.*hcallLibInitGuest failed, error -1"), lines.get(2));
-        TestNative.configureHost(true, new int[0]);  // the device opens again
+        configureHost(true, new int[0]);  // the device opens again
         s.native_init();
-        assertEquals(List.of(request(12, "en-US"), request(7, 1), request(18, "late")), Bridge.drain(s, true),
+        assertEquals(List.of(request(12, "en-US"), request(7, 1), request(18, "late")), drain(s, true),
                 "the waiting events reach the host in order once a start connects");
-        assertEquals(1, TestNative.openDevices(), "connections");
+        assertEquals(1, openDevices(), "connections");
     }
 
-    /**
-     * Ends the process (System.exit, or main returning) while the worker is
-     * inside a host call that the host answers only once the library's static
-     * destructors have run; the helper then reports whether the call came back.
-     */
+    /** Ends the process while the worker is inside a host call that the host answers only after static destructors. */
     static void exitBusy(boolean viaSystemExit) {
-        KivHostCallService s = Bridge.started();
-        TestNative.holdUntilExit(12);
+        KivHostCallService s = started();
+        holdUntilExit(12);
         s.native_onLocaleChanged("held");
-        assertTrue(TestNative.awaitHeld(Bridge.WAIT.toMillis()), "the worker reached the host");
+        assertTrue(awaitHeld(WAIT.toMillis()), "the worker reached the host");
         s.native_setClipboardText("queued behind the held call");
         if (viaSystemExit) System.exit(5);
     }
 
-    /** Without the service class on the class path JNI_OnLoad cannot register the methods. */
     static void noService() {
         System.load(System.getProperty("hostcall.testlib"));
-        TestNative.startLogCapture();
-        TestNative.keepLoaded(System.getProperty("hostcall.lib"));
-        assertThrows(UnsatisfiedLinkError.class, () -> System.load(System.getProperty("hostcall.lib")),
-                "the JVM sees JNI_OnLoad's -1");
-        assertEquals(List.of(ON_LOAD, error("ERROR: KivHostCallService native registration failed")),
-                Bridge.bridgeLines(0));
+        keepLoaded(System.getProperty("hostcall.lib"));
+        assertThrows(UnsatisfiedLinkError.class, () -> System.load(System.getProperty("hostcall.lib")), "JNI_OnLoad -1");
+        assertEquals(List.of(ON_LOAD, error("ERROR: KivHostCallService native registration failed")), bridgeLines(0));
     }
 
-    /**
-     * Three senders and two askers that never stop, a native_init at a random
-     * moment (or none), and an end at a random moment: "exit" (System.exit(3)),
-     * "end" (main returns) or "throw" (main throws).
-     */
+    /** Senders that never stop, a native_init at a random moment or none, and an end at a random moment. */
     static void soakExit(String how, long seed) throws Exception {
         SplittableRandom random = new SplittableRandom(seed);
-        KivHostCallService s = Bridge.load();
-        long initAtMs = random.nextLong(100);
-        long endAtMs = random.nextLong(400);
+        KivHostCallService s = load();
+        long initAtMs = random.nextLong(100), endAtMs = random.nextLong(400);
         for (int id : new int[] {0, 1, 2, SoakTest.PRODUCERS, SoakTest.PRODUCERS + 1}) {
             SoakTest.Sender sender = new SoakTest.Sender(seed, id);
-            Thread thread = new Thread(() -> {
-                for (;;) {
-                    sender.next();
-                    sender.send(s);
-                }
-            });
+            Thread thread = new Thread(() -> { for (;;) sender.send(s); });
             thread.setDaemon(true);
             thread.start();
         }
@@ -247,13 +190,9 @@ class ProcessTest {
             s.native_init();
         }
         Thread.sleep(Math.max(0, endAtMs - (System.nanoTime() - started) / 1_000_000));
-        System.out.println("ending: " + how + " initAtMs=" + (initAtMs < endAtMs ? initAtMs : "never") + " endAtMs="
-                + endAtMs + " served=" + TestNative.served());
+        System.out.println("ending: " + how + " initAtMs=" + (initAtMs < endAtMs ? initAtMs : "never") + " endAtMs=" + endAtMs);
         System.out.flush();
-        switch (how) {
-            case "exit" -> System.exit(3);
-            case "throw" -> throw new IllegalStateException("the soak ends with an uncaught exception");
-            default -> { }
-        }
+        if (how.equals("exit")) System.exit(3);
+        if (how.equals("throw")) throw new IllegalStateException("the soak ends with an uncaught exception");
     }
 }
