@@ -1,5 +1,4 @@
-// What fuzz targets share: a failed expectation stops the run as a crash, so
-// libFuzzer keeps the input that caused it.
+// A failed expectation stops a fuzz run as a crash, so libFuzzer keeps the input.
 #pragma once
 
 #include <cstdint>

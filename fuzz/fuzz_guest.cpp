@@ -1,11 +1,10 @@
-// Any host-call operation with argument values drawn from the input (strings
-// of any bytes but NUL, any ints and bools, buffer lengths around zero)
-// against the device model, under a layout and a reply chosen by the input:
-// the proper reply, a cut one, noise over the whole guest-bound buffer, raw
-// bytes, or a failed exchange. Checked against rules written here: the
-// request against an encoding of the wire rules, and what the guest hands
-// back against the bytes in the guest-bound buffer. The guest must stay
-// inside its buffers and the caller's storage.
+// Any host-call operation with arguments drawn from the input (strings of any
+// bytes but NUL, any ints and bools, buffer lengths around zero) against the
+// device model, under a layout and a reply the input chooses: proper, cut,
+// noise over the guest-bound buffer, raw bytes, or a failed exchange. The
+// request must follow the wire rules, what the guest hands back must be the
+// guest-bound buffer's bytes, and the guest must stay inside its buffers and
+// the caller's storage.
 #include <errno.h>
 #include <fuzzer/FuzzedDataProvider.h>
 
@@ -16,7 +15,7 @@
 #include <vector>
 
 #include "FuzzCheck.h"
-#include "VmsgDeviceModel.h"
+#include "hcall/DeviceSession.h"
 #include "support/HcallInvoke.h"
 #include "support/LogRecorder.h"
 
@@ -24,14 +23,14 @@ namespace {
 
 using fuzz::expect;
 
-// What a filled i32 * and u64 * hold before the call, so that a call the
-// host did not answer can be seen to leave them alone.
+// What a filled i32 * and u64 * hold before the call, to show a call the host
+// did not answer leaves them alone.
 constexpr int32_t kUntouchedI32 = 0x5A5A5A5A;
 constexpr uint64_t kUntouchedU64 = 0x5A5A5A5A5A5A5A5AULL;
 
 struct Arg {
     hcall::Kind kind = hcall::I32;
-    std::string text;   // Str: cut at its first NUL, so c_str() holds all of it
+    std::string text;   // Str: no NUL inside, so c_str() holds all of it
     int32_t value = 0;  // I32; after a Buf it is that buffer's length
     bool flag = false;
     std::unique_ptr<char[]> buffer;  // Buf: exactly its size, so ASan sees any access past it
@@ -40,7 +39,7 @@ struct Arg {
     uint64_t outU64 = kUntouchedU64;
 };
 
-// A drawn call; hands its arguments to hcalltest::invokeExported.
+// A drawn call, handing its arguments to hcalltest::invokeExported.
 struct Call {
     const hcall::OpInfo* op = nullptr;
     Arg args[hcall::kMaxParams];
@@ -48,25 +47,18 @@ struct Call {
     template <hcall::Kind K>
     auto get(size_t i) {
         Arg& a = args[i];
-        if constexpr (K == hcall::Str) {
-            return a.text.c_str();
-        } else if constexpr (K == hcall::I32) {
-            return a.value;
-        } else if constexpr (K == hcall::Bool) {
-            return a.flag;
-        } else if constexpr (K == hcall::Buf) {
-            return a.buffer.get();
-        } else if constexpr (K == hcall::OutI32) {
-            return &a.outI32;
-        } else {
-            return &a.outU64;
-        }
+        if constexpr (K == hcall::Str) return a.text.c_str();
+        if constexpr (K == hcall::I32) return a.value;
+        if constexpr (K == hcall::Bool) return a.flag;
+        if constexpr (K == hcall::Buf) return a.buffer.get();
+        if constexpr (K == hcall::OutI32) return &a.outI32;
+        if constexpr (K == hcall::OutU64) return &a.outU64;
     }
 };
 
 void drawCall(FuzzedDataProvider& in, Call& call) {
-    call.op = hcall::findOp(in.ConsumeIntegralInRange<uint32_t>(1, hcall::kNumOps));
-    const hcall::OpInfo& op = *call.op;
+    const hcall::OpInfo& op =
+        *(call.op = hcall::findOp(in.ConsumeIntegralInRange<uint32_t>(1, hcall::kNumOps)));
     for (int i = 0; i < op.numParams; ++i) {
         Arg& a = call.args[i];
         a.kind = op.params[i];
@@ -77,13 +69,12 @@ void drawCall(FuzzedDataProvider& in, Call& call) {
                           ? in.ConsumeIntegralInRange<int32_t>(-2, 200)  // the buffer's length
                           : in.ConsumeIntegral<int32_t>();
     }
-    for (int i = 0; i < op.numParams; ++i) {  // the catalogue puts every length after its buffer
+    for (int i = 0; i < op.numParams; ++i) {  // every length follows its buffer
         Arg& a = call.args[i];
         if (a.kind != hcall::Buf) continue;
-        const size_t size = size_t(std::max(call.args[i + 1].value, 0));
-        a.before = in.ConsumeBytesAsString(size);
-        a.before.resize(size, '\0');
-        a.buffer.reset(new char[size]);
+        a.before = in.ConsumeBytesAsString(size_t(std::max(call.args[i + 1].value, 0)));
+        a.before.resize(size_t(std::max(call.args[i + 1].value, 0)), '\0');
+        a.buffer.reset(new char[a.before.size()]);
         std::copy(a.before.begin(), a.before.end(), a.buffer.get());
     }
 }
@@ -92,35 +83,26 @@ void put32(std::vector<uint8_t>& out, uint32_t v) {
     for (int i = 0; i < 4; ++i) out.push_back(uint8_t(v >> (8 * i)));
 }
 
-// The request as the wire rules lay it out, and the size of its reply.
-std::vector<uint8_t> referenceRequest(const Call& call, uint64_t& replySize, bool& lengthsValid) {
-    std::vector<uint8_t> out(8);
+// The request as the wire rules lay it out; no reply fits a negative length.
+std::vector<uint8_t> referenceRequest(const Call& call, uint64_t& replySize) {
+    std::vector<uint8_t> out;
+    put32(out, call.op->code);
+    put32(out, 0);
     replySize = 4;
-    lengthsValid = true;
+    bool negative = false;
     for (int i = 0; i < call.op->numParams; ++i) {
         const Arg& a = call.args[i];
-        if (a.kind == hcall::Str) {
-            put32(out, uint32_t(a.text.size() + 1));
-            out.insert(out.end(), a.text.c_str(), a.text.c_str() + a.text.size() + 1);
-        }
-        if (a.kind == hcall::I32) put32(out, uint32_t(a.value));
-        if (a.kind == hcall::Bool) put32(out, a.flag ? 1 : 0);
-        if (a.kind == hcall::Buf) {
-            const int32_t length = call.args[i + 1].value;
-            put32(out, uint32_t(length));
-            lengthsValid = lengthsValid && length >= 0;
-            replySize += uint64_t(std::max(length, 0));
-        }
-        if (a.kind == hcall::OutI32 || a.kind == hcall::OutU64) {
-            const uint32_t size = a.kind == hcall::OutI32 ? 4 : 8;
-            put32(out, size);
-            replySize += size;
-        }
+        const int32_t length = a.kind == hcall::Buf ? call.args[i + 1].value : 0;
+        const uint32_t sizes[] = {
+            uint32_t(a.text.size() + 1), uint32_t(a.value), a.flag, uint32_t(length), 4, 8};
+        put32(out, sizes[a.kind]);
+        if (a.kind == hcall::Str) out.insert(out.end(), a.text.c_str(), a.text.c_str() + sizes[0]);
+        if (a.kind >= hcall::Buf)
+            replySize += a.kind == hcall::Buf ? uint64_t(length) : sizes[a.kind];
+        negative = negative || length < 0;
     }
-    std::vector<uint8_t> header;
-    put32(header, call.op->code);
-    put32(header, uint32_t(out.size()));
-    std::copy(header.begin(), header.end(), out.begin());
+    if (negative) replySize = UINT64_MAX;
+    for (int i = 0; i < 4; ++i) out[4 + i] = uint8_t(out.size() >> (8 * i));
     return out;
 }
 
@@ -138,7 +120,6 @@ VmsgDeviceScript drawScript(FuzzedDataProvider& in) {
             s.hostBoundCapacity = in.ConsumeIntegralInRange<uint32_t>(0, 8192);
             s.guestBoundCapacity = in.ConsumeIntegralInRange<uint32_t>(0, 8192);
             s.guestBoundOffset = in.ConsumeIntegralInRange<uint32_t>(0, 12288);
-            break;
     }
     s.replyMode = static_cast<VmsgDeviceReplyMode>(in.ConsumeIntegralInRange<int>(0, 3));
     s.shortReplyBytes = in.ConsumeIntegralInRange<uint32_t>(0, 80);
@@ -155,7 +136,7 @@ VmsgDeviceScript drawScript(FuzzedDataProvider& in) {
 
 LogRecorder* gLog = nullptr;
 
-// Host-call exit lines ("returning [%d] from ...") written since the last clear.
+// Host-call exit lines since the last clear.
 std::vector<std::string> exitLines() {
     std::vector<std::string> found;
     for (const std::string& text : gLog->texts(XLOG_MODULE_HCALL))
@@ -163,75 +144,60 @@ std::vector<std::string> exitLines() {
     return found;
 }
 
-// The host was not asked or did not answer: -1 (the launch query: true), no
-// exit line, and the caller's storage as it was.
+// Unasked or unanswered: -1 (the launch query: true), no exit line, and the
+// caller's storage as it was.
 void expectUnanswered(const Call& call, int64_t result) {
     expect(result == (call.op->result == hcall::Flag ? 1 : -1), "an unanswered call returns -1");
     expect(exitLines().empty(), "an unanswered call writes no exit line");
-    for (int i = 0; i < call.op->numParams; ++i) {
-        const Arg& a = call.args[i];
-        expect(a.kind != hcall::Buf || std::equal(a.before.begin(), a.before.end(), a.buffer.get()),
-               "an unanswered call leaves the buffer alone");
-        expect(a.outI32 == kUntouchedI32 && a.outU64 == kUntouchedU64,
-               "an unanswered call leaves the i32 * and u64 * alone");
-    }
+    for (const Arg& a : call.args)
+        expect((a.kind != hcall::Buf ||
+                std::equal(a.before.begin(), a.before.end(), a.buffer.get())) &&
+                   a.outI32 == kUntouchedI32 && a.outU64 == kUntouchedU64,
+               "an unanswered call leaves the caller's storage alone");
 }
 
 void callOnce(FuzzedDataProvider& in, bool connected) {
     Call call;
     drawCall(in, call);
     uint64_t replySize = 0;
-    bool lengthsValid = false;
-    const std::vector<uint8_t> request = referenceRequest(call, replySize, lengthsValid);
+    const std::vector<uint8_t> request = referenceRequest(call, replySize);
     const VmsgGuestClient& c = g_hcall.client;
-    const bool fits = connected && lengthsValid && request.size() <= c.mMaxHostBoundSize &&
-                      replySize <= c.mMaxGuestBoundSize;
+    const bool fits =
+        connected && request.size() <= c.mMaxHostBoundSize && replySize <= c.mMaxGuestBoundSize;
     const size_t before = vmsgDeviceExchanges().size();
     gLog->clear();
     const int64_t result = hcalltest::invokeExported(call.op->code, call);
     const std::vector<VmsgDeviceExchange> after = vmsgDeviceExchanges();
-
-    if (!fits) {
-        expect(after.size() == before, "a call over a limit reaches no host");
-        return expectUnanswered(call, result);
+    expect(after.size() == before + fits, "a call within the limits makes one exchange, else none");
+    if (fits) {
+        expect(after.back().request == request, "the request bytes follow the wire rules");
+        expect(after.back().wellFormed, "the host reads the request as well formed");
     }
-    expect(after.size() == before + 1, "an accepted call makes one exchange");
-    const VmsgDeviceExchange& x = after.back();
-    expect(x.request == request, "the request bytes follow the wire rules");
-    expect(x.wellFormed, "the host reads the request as well formed");
-    if (x.sendErrno != 0) return expectUnanswered(call, result);
+    if (!fits || after.back().sendErrno != 0) return expectUnanswered(call, result);
 
-    // Later calls meet what earlier replies left: the reply is whatever the
-    // guest-bound buffer holds.
+    // Filled data in parameter order, then the result: whatever the guest-bound
+    // buffer holds, which may be what earlier replies left.
     const auto* reply = static_cast<const uint8_t*>(c.mGuestBoundBuf);
-    expect(x.reply.empty() || std::memcmp(x.reply.data(), reply, x.reply.size()) == 0,
-           "the guest-bound buffer holds what the host wrote");
     size_t pos = 0;
-    for (int i = 0; i < call.op->numParams; ++i) {
-        const Arg& a = call.args[i];
+    for (const Arg& a : call.args) {
+        if (a.kind < hcall::Buf) continue;
         const void* got = a.kind == hcall::Buf      ? static_cast<const void*>(a.buffer.get())
                           : a.kind == hcall::OutI32 ? static_cast<const void*>(&a.outI32)
                                                     : &a.outU64;
         const size_t size = a.kind == hcall::Buf      ? a.before.size()
                             : a.kind == hcall::OutI32 ? 4
                                                       : 8;
-        if (a.kind != hcall::Buf && a.kind != hcall::OutI32 && a.kind != hcall::OutU64) continue;
-        expect(size == 0 || std::memcmp(got, reply + pos, size) == 0,
-               "filled data is exactly its size of reply bytes, in parameter order");
+        expect(size == 0 || std::memcmp(got, reply + pos, size) == 0, "filled data is the reply's");
         pos += size;
     }
-    // The exit line shows the result; for the launch query, its byte's value.
     int32_t shown = int32_t(fuzz::le32(reply + pos));
-    if (call.op->result == hcall::Flag) {
-        expect(result == (reply[pos] != 0), "the launch answer is its field's first byte");
-        shown = reply[pos];
-    } else {
-        expect(result == shown, "the result is the reply's last word");
-    }
-    const std::string lead =
-        "returning [" + std::to_string(shown) + "] from " + call.op->name + "(";
+    if (call.op->result == hcall::Flag) shown = reply[pos];
+    expect(result == (call.op->result == hcall::Flag ? shown != 0 : shown),
+           "the result is the reply's last field");
+    const std::string lead = "returning [" + std::to_string(shown) + "] from " + call.op->name;
     const std::vector<std::string> exits = exitLines();
-    expect(exits.size() == 1 && exits[0].rfind(lead, 0) == 0, "one exit line, showing the reply");
+    expect(exits.size() == 1 && exits[0].rfind(lead + "(", 0) == 0,
+           "one exit line, showing the reply");
 }
 
 }  // namespace
@@ -243,11 +209,7 @@ extern "C" int LLVMFuzzerInitialize(int*, char***) {
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     FuzzedDataProvider in(data, size);
-    const VmsgDeviceScript script = drawScript(in);
-    if (g_hcall.client.mFd >= 0) g_hcall.client.disconnect();
-    vmsgDeviceReset();
-    vmsgDeviceConfigure(script);
-    const bool connected = hcallLibInitGuest() == XERR_SUCCESS;
+    const bool connected = HcallSession::start(drawScript(in));
     for (int calls = 0; calls < 3 && in.remaining_bytes() > 0; ++calls) callOnce(in, connected);
     return 0;
 }

@@ -1,6 +1,6 @@
-// Host calls from several threads at once share one connection: the device
-// must never see two exchanges in flight, and every caller must get its own
-// reply. Reading the capacities never waits for an exchange.
+// Host calls from several threads share one connection: the device never sees
+// two exchanges in flight, every caller gets its own reply, and reading the
+// capacities never waits for an exchange.
 
 #include <gtest/gtest.h>
 
@@ -25,9 +25,7 @@ TEST(HcallThreads, Calls_FromSeveralThreadsAtOnce_NeverOverlapAndEachGetsItsOwnR
     script.propsValue = 123;
     script.delayUs = 20;  // holds each exchange open long enough for a collision
     HcallSession session(script);
-    ASSERT_TRUE(session.connected());
-    constexpr int kCallsPerThread = 200;
-
+    ASSERT_TRUE(session.connected);
     // Each thread makes a call whose reply no other thread's call gets.
     const std::vector<std::function<bool()>> callers = {
         [] { return hcallOnOrientationChangedRpc(1) == 700; },
@@ -41,31 +39,28 @@ TEST(HcallThreads, Calls_FromSeveralThreadsAtOnce_NeverOverlapAndEachGetsItsOwnR
                    std::string(buffer) == "props" && value == 123;
         },
     };
+    constexpr int kCalls = 200;  // per thread
     Gate start;
     std::vector<int> wrong(callers.size(), 0);
     std::vector<std::thread> threads;
     for (size_t t = 0; t < callers.size(); ++t) {
         threads.emplace_back([&, t] {
             start.wait();
-            for (int i = 0; i < kCallsPerThread; ++i) wrong[t] += !callers[t]();
+            for (int i = 0; i < kCalls; ++i) wrong[t] += !callers[t]();
         });
     }
     start.open();
     for (std::thread& thread : threads) thread.join();
-
-    for (size_t t = 0; t < callers.size(); ++t)
-        EXPECT_EQ(wrong[t], 0) << "thread " << t << " got another call's reply";
+    EXPECT_EQ(wrong, std::vector<int>(callers.size(), 0)) << "calls got another call's reply";
     EXPECT_EQ(vmsgDeviceOverlapCount(), 0u) << "two exchanges were in flight at once";
-    std::vector<VmsgDeviceExchange> exchanges = vmsgDeviceExchanges();
-    EXPECT_EQ(exchanges.size(), callers.size() * kCallsPerThread);
-    for (const VmsgDeviceExchange& exchange : exchanges)
-        ASSERT_TRUE(exchange.wellFormed) << "a request was written while another was read";
+    const std::vector<VmsgDeviceExchange> exchanges = vmsgDeviceExchanges();
+    EXPECT_EQ(exchanges.size(), callers.size() * kCalls);
+    for (const VmsgDeviceExchange& exchange : exchanges) ASSERT_TRUE(exchange.wellFormed);
 }
 
 // Regression: the capacities were read under the exchange lock, so a caller
-// waited behind a host call, which has no time limit. A reader running all
-// along, wanting only the host-bound size, also shows (under ThreadSanitizer)
-// that connecting races with no one.
+// waited behind a host call, which has no time limit. A reader spinning all
+// through connecting also shows (under ThreadSanitizer) that it races no one.
 TEST(HcallThreads, GetBufferSizes_DuringConnectAndExchanges_NeverWaits) {
     std::atomic<bool> reading{true};
     std::thread spinner([&] {
@@ -78,16 +73,14 @@ TEST(HcallThreads, GetBufferSizes_DuringConnectAndExchanges_NeverWaits) {
     }));
     reading = false;
     spinner.join();
-    ASSERT_TRUE(session.connected());
-    Gate inHost, release;
+    ASSERT_TRUE(session.connected);
+    Gate inHost, release, answered;
     vmsgDeviceSetHostHook([&](uint32_t) {
         inHost.open();
         release.wait(2 * kGateTolerance);  // outlasts the reader's wait below
     });
     std::thread caller([] { hcallOnOrientationChangedRpc(1); });
     ASSERT_TRUE(inHost.wait());
-
-    Gate answered;
     int sizes[2] = {0, 0};
     std::thread reader([&] {
         hcallGetBufferSizes(nullptr, nullptr);  // a null pointer is skipped
