@@ -42,8 +42,7 @@ std::vector<Row> readCorpus() {
 }
 
 // Answers every operation with a row's own values.
-class RowHost : public HcallHandler {
-  public:
+struct RowHost : HcallHandler {
     RowHost(const HcallRequest& answer, int32_t result) : mAnswer(answer), mResult(result) {}
     int32_t unhandled(const hcall::OpInfo& op) override {
         entered = op.code;
@@ -62,8 +61,6 @@ class RowHost : public HcallHandler {
         return mResult;
     }
     uint32_t entered = 0;
-
-  private:
     const HcallRequest& mAnswer;
     int32_t mResult;
 };
@@ -77,21 +74,16 @@ struct GuestCall {
     template <hcall::Kind K>
     auto get(size_t i) {
         HcallValue& v = values.params[i];
-        if constexpr (K == hcall::Str) {
-            return v.text.data();
-        } else if constexpr (K == hcall::I32) {
-            return v.i32;
-        } else if constexpr (K == hcall::Bool) {
-            return v.flag;
-        } else if constexpr (K == hcall::Buf) {
+        if constexpr (K == hcall::Buf) {
             buffers[i].reset(new char[v.size + 1]());
             v.text = {buffers[i].get(), v.size};
-            return buffers[i].get();
-        } else if constexpr (K == hcall::OutI32) {
-            return &v.i32;
-        } else {
-            return &v.u64;
         }
+        if constexpr (K == hcall::Str) return v.text.data();
+        if constexpr (K == hcall::I32) return v.i32;
+        if constexpr (K == hcall::Bool) return v.flag;
+        if constexpr (K == hcall::Buf) return buffers[i].get();
+        if constexpr (K == hcall::OutI32) return &v.i32;
+        if constexpr (K == hcall::OutU64) return &v.u64;
     }
 };
 

@@ -19,14 +19,11 @@ char gBuffer[16];
 int32_t gValue;
 uint64_t gTime;
 
-std::string pointer(const void* p) {
-    char text[32];
-    std::snprintf(text, sizeof(text), "%p", p);
-    return text;
-}
-
 TEST(HcallLog, Lines_OfEveryShape_AreExact) {
-    const std::string v = pointer(&gValue), t = pointer(&gTime);
+    char pv[32], pt[32];
+    std::snprintf(pv, sizeof(pv), "%p", static_cast<void*>(&gValue));
+    std::snprintf(pt, sizeof(pt), "%p", static_cast<void*>(&gTime));
+    const std::string v = pv, t = pt;
     const char* props = "xerr_t hcallGetPropsRpc(char *, i32, i32 *)";
     const char* time = "xerr_t hcallGetTimeInfoRpc(u64 *, char *, i32)";
     const char* locale = "xerr_t hcallOnLocaleChangedRpc(const char *)";
@@ -52,12 +49,6 @@ TEST(HcallLog, Lines_OfEveryShape_AreExact) {
         {"i32 before an empty string", nullptr, [] { hcallOnVibrateRpc(100, ""); },
          "xerr_t hcallOnVibrateRpc(i32, const char *)", "%s(%d, %s)\n",
          "hcallOnVibrateRpc(100, )\n", 0},
-        {"eight parameters", nullptr,
-         [] { hcallOnAppInstalledRpc("p", "a", "l", 3, "v", "i", "s", 0); },
-         "xerr_t hcallOnAppInstalledRpc(const char *, const char *, const char *, i32, "
-         "const char *, const char *, const char *, bool)",
-         "%s(%s, %s, %s, %d, %s, %s, %s, %d)\n", "hcallOnAppInstalledRpc(p, a, l, 3, v, i, s, 0)\n",
-         0},
         {"launch query prints the reply byte",
          [](VmsgDeviceScript& s) {
              s.replyMode = VmsgDeviceReplyMode::Raw;
@@ -123,15 +114,9 @@ TEST(HcallLog, Lines_OfEveryShape_AreExact) {
 }
 
 TEST(HcallLog, Lines_WhenLevelIsOff_AreNeverFormatted) {
-    LogRecorder log(XLOG_LEVEL_I);
     HcallSession session;
     ASSERT_TRUE(session.connected);
-    log.clear();
-    hcallOnOrientationChangedRpc(2);
-    EXPECT_EQ(log.texts(XLOG_MODULE_HCALL),
-              std::vector<std::string>{"hcallOnOrientationChangedRpc(2)\n"});
-    log.setMaxLevel(XLOG_LEVEL_W);
-    log.clear();
+    LogRecorder log(XLOG_LEVEL_W);
     hcallOnOrientationChangedRpc(3);
     EXPECT_TRUE(log.lines(XLOG_MODULE_HCALL).empty());
     EXPECT_TRUE(log.lines(XLOG_MODULE_VMSG).empty());
