@@ -177,12 +177,9 @@ void callOnce(FuzzedDataProvider& in, bool connected) {
 
 }  // namespace
 
-extern "C" int LLVMFuzzerInitialize(int*, char***) {
-    new LogRecorder();  // every line formatted in full, so ASan sees what each reads
-    return 0;
-}
-
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
+    static LogRecorder log;  // formats every line in full, so ASan sees what each reads
+    log.clear();
     FuzzedDataProvider in(data, size);
     const bool connected = HcallSession::start(drawScript(in));
     for (int calls = 0; calls < 3 && in.remaining_bytes() > 0; ++calls) callOnce(in, connected);
