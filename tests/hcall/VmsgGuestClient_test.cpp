@@ -87,33 +87,34 @@ TEST(VmsgGuestClient, ConnectThenDisconnect_FollowTheDevice) {
 // own: the caller's getHostBoundBuffer has already said why.
 TEST(VmsgGuestClient, Exchange_OfEachLengthAndState_IsServedOrRefused) {
     enum State { Unconnected, Connected, Disconnected };
-    enum Want { Null, HostBuffer, GuestBuffer };
+    void* VmsgGuestClient::*const host = &VmsgGuestClient::mHostBoundBuf;
+    void* VmsgGuestClient::*const guest = &VmsgGuestClient::mGuestBoundBuf;
     const struct {
         const char* name;
         State state;
         bool process;  // processRequest rather than getHostBoundBuffer
         uint32_t len;
-        Want want;
+        void* VmsgGuestClient::*want;
         size_t sent;        // SEND_RECEIVE requests that reached the device
         std::string error;  // after "<signature>:<line> " or "<signature>: service <name>: "
         int sendErrno = 0;
     } rows[] = {
-        {"buffer of 0 bytes", Connected, false, 0, HostBuffer, 0, ""},
-        {"buffer one below capacity", Connected, false, 255, HostBuffer, 0, ""},
-        {"buffer at capacity", Connected, false, 256, HostBuffer, 0, ""},
-        {"buffer one over capacity", Connected, false, 257, Null, 0,
+        {"buffer of 0 bytes", Connected, false, 0, host, 0, ""},
+        {"buffer one below capacity", Connected, false, 255, host, 0, ""},
+        {"buffer at capacity", Connected, false, 256, host, 0, ""},
+        {"buffer one over capacity", Connected, false, 257, nullptr, 0,
          "len 257, mMaxHostBoundSize 256"},
-        {"request at capacity", Connected, true, 256, GuestBuffer, 1, ""},
-        {"request one over capacity", Connected, true, 257, Null, 0, ""},
-        {"request the device fails", Connected, true, 8, Null, 1,
+        {"request at capacity", Connected, true, 256, guest, 1, ""},
+        {"request one over capacity", Connected, true, 257, nullptr, 0, ""},
+        {"request the device fails", Connected, true, 8, nullptr, 1,
          "SEND_RECEIVE ioctl failed: ret -1, errno 5", EIO},
-        {"buffer before connect", Unconnected, false, 1, Null, 0, "len 1, mMaxHostBoundSize 0"},
-        {"empty buffer before connect", Unconnected, false, 0, Null, 0, "not connected"},
-        {"request before connect", Unconnected, true, 0, Null, 0, ""},
+        {"buffer before connect", Unconnected, false, 1, nullptr, 0, "len 1, mMaxHostBoundSize 0"},
+        {"empty buffer before connect", Unconnected, false, 0, nullptr, 0, "not connected"},
+        {"request before connect", Unconnected, true, 0, nullptr, 0, ""},
         // Regression: capacities outlive a disconnect, so an exchange was let
         // through onto an unmapped buffer and a closed descriptor.
-        {"buffer after disconnect", Disconnected, false, 16, Null, 0, "not connected"},
-        {"request after disconnect", Disconnected, true, 16, Null, 0, ""},
+        {"buffer after disconnect", Disconnected, false, 16, nullptr, 0, "not connected"},
+        {"request after disconnect", Disconnected, true, 16, nullptr, 0, ""},
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.name);
@@ -128,13 +129,10 @@ TEST(VmsgGuestClient, Exchange_OfEachLengthAndState_IsServedOrRefused) {
         LogRecorder log;
         void* got =
             row.process ? c.processRequest(nullptr, row.len) : c.getHostBoundBuffer(row.len);
-        void* want = row.want == HostBuffer    ? c.mHostBoundBuf
-                     : row.want == GuestBuffer ? c.mGuestBoundBuf
-                                               : nullptr;
         const std::vector<LoggedLine> trace = vmsgLines(log, XLOG_LEVEL_I);
         const std::vector<LoggedLine> errors = vmsgLines(log, XLOG_LEVEL_E);
         if (c.mFd >= 0) c.disconnect();
-        EXPECT_EQ(got, want);
+        EXPECT_EQ(got, row.want ? c.*row.want : nullptr);
         EXPECT_EQ(countEvents(VmsgDeviceEventKind::SendReceive), row.sent);
         ASSERT_EQ(trace.size(), 1u);
         EXPECT_EQ(trace[0].function, row.process
