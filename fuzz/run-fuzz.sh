@@ -1,36 +1,21 @@
 #!/usr/bin/env bash
-# Runs every fuzz target of a fuzz build for a bounded time, each on a working
-# copy of its seed corpus, and fails when any of them finds a crash, a failed
-# expectation or a hang. The working corpus and any crashing input stay in
-# BUILD_DIR/fuzz-work/<target>/.
-# Usage: fuzz/run-fuzz.sh BUILD_DIR [SECONDS_PER_TARGET]
+# Runs the fuzz target of a fuzz build for a bounded time on a working copy of
+# its seeds; fails on a crash, a failed expectation or a hang. The working
+# corpus and any crashing input stay in BUILD_DIR/fuzz-work/fuzz_guest/.
+# Usage: fuzz/run-fuzz.sh BUILD_DIR [SECONDS]
 set -euo pipefail
-build=${1:?usage: run-fuzz.sh BUILD_DIR [SECONDS_PER_TARGET]}
+build=${1:?usage: run-fuzz.sh BUILD_DIR [SECONDS]}
 seconds=${2:-60}
-seeds=$(cd "$(dirname "$0")" && pwd)/corpus
-
-targets=(fuzz_hcall_decode fuzz_guest fuzz_level_split)
-passed=0
-failed=0
-for target in "${targets[@]}"; do
-  work=$build/fuzz-work/$target
-  mkdir -p "$work/corpus" "$work/artifacts"
-  # Seeds join what earlier runs found; the repository's copy is never written.
-  for seed in "$seeds/$target"/*; do
-    [[ -e "$work/corpus/${seed##*/}" ]] || cp "$seed" "$work/corpus/"
-  done
-  echo "== $target: ${seconds}s from $(ls "$work/corpus" | wc -l) inputs"
-  if HOSTCALL_TEST_KMSG=/dev/null UBSAN_OPTIONS=print_stacktrace=1:halt_on_error=1 \
-    "$build/bin/$target" -max_total_time="$seconds" -timeout=10 -rss_limit_mb=2048 \
-    -max_len=4096 -use_value_profile=1 -print_final_stats=1 -artifact_prefix="$work/artifacts/" \
-    "$work/corpus" >"$work/log" 2>&1; then
-    passed=$((passed + 1))
-    grep -E '^(Done|stat::number_of_executed_units|stat::peak_rss_mb)' "$work/log" || true
-  else
-    failed=$((failed + 1))
-    tail -n 60 "$work/log"
-    echo "!! $target failed; input kept in $work/artifacts/"
-  fi
-done
-echo "fuzz: $passed passed, $failed failed"
-[[ $failed -eq 0 ]]
+work=$build/fuzz-work/fuzz_guest
+mkdir -p "$work/corpus" "$work/artifacts"
+cp -n "$(dirname "$0")"/corpus/fuzz_guest/* "$work/corpus/" || true  # seeds join earlier finds
+echo "== fuzz_guest: ${seconds}s from $(ls "$work/corpus" | wc -l) inputs"
+if ! HOSTCALL_TEST_KMSG=/dev/null UBSAN_OPTIONS=print_stacktrace=1:halt_on_error=1 \
+  "$build/bin/fuzz_guest" -max_total_time="$seconds" -timeout=10 -rss_limit_mb=2048 \
+  -max_len=4096 -use_value_profile=1 -print_final_stats=1 -artifact_prefix="$work/artifacts/" \
+  "$work/corpus" >"$work/log" 2>&1; then
+  tail -n 60 "$work/log"
+  echo "!! fuzz_guest failed; input kept in $work/artifacts/"
+  exit 1
+fi
+grep -E '^(Done|stat::number_of_executed_units|stat::peak_rss_mb)' "$work/log" || true

@@ -1,37 +1,29 @@
 // g_hcall connected to the device model, and readers for what the device saw.
 #pragma once
 
-#include <string>
-#include <vector>
-
 #include "VmsgDeviceModel.h"
 #include "hcall/guest/HcallEnc.h"
 
-// g_hcall connected to the device model under `script` for the life of the
-// object; disconnected again afterwards so that every test starts alike.
-class HcallSession {
-  public:
-    explicit HcallSession(const VmsgDeviceScript& script = VmsgDeviceScript()) {
-        if (g_hcall.client.mFd >= 0) g_hcall.client.disconnect();
-        vmsgDeviceReset();
-        vmsgDeviceConfigure(script);
-        connected_ = hcallLibInitGuest() == XERR_SUCCESS;
-    }
+// g_hcall connected under a script for the object's life, so every test starts alike.
+struct HcallSession {
+    explicit HcallSession(const VmsgDeviceScript& script = {}) : connected(start(script)) {}
     ~HcallSession() {
-        if (g_hcall.client.mFd >= 0) g_hcall.client.disconnect();
+        stop();
         vmsgDeviceSetHostHook({});
         vmsgDeviceReset();
     }
-    HcallSession(const HcallSession&) = delete;
-    HcallSession& operator=(const HcallSession&) = delete;
-
-    bool connected() const { return connected_; }
-
-  private:
-    bool connected_ = false;
+    static bool start(const VmsgDeviceScript& script) {
+        stop();
+        vmsgDeviceReset();
+        vmsgDeviceConfigure(script);
+        return hcallLibInitGuest() == XERR_SUCCESS;
+    }
+    static void stop() {
+        if (g_hcall.client.mFd >= 0) g_hcall.client.disconnect();
+    }
+    const bool connected;
 };
 
-// A script changed by `tweak`, for table rows.
 using ScriptTweak = void (*)(VmsgDeviceScript&);
 inline VmsgDeviceScript scriptWith(ScriptTweak tweak) {
     VmsgDeviceScript script;

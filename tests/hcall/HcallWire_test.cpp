@@ -1,16 +1,21 @@
-// Host calls through the device model beyond what the golden corpus holds:
-// the limits of both shared buffers, replies no proper host builds, and
-// exchanges that fail or never start.
+// Host calls through the device model beyond the golden corpus: the limits of
+// both shared buffers, replies no proper host builds, exchanges that fail or
+// never start, and callers on several threads sharing one connection.
 
 #include <gtest/gtest.h>
 #include <sys/mman.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <cerrno>
 #include <cstring>
+#include <functional>
 #include <string>
+#include <thread>
+#include <vector>
 
 #include "DeviceSession.h"
+#include "support/Gate.h"
 #include "support/LogRecorder.h"
 
 namespace {
@@ -19,10 +24,34 @@ char gBuffer[80];
 int32_t gValue;
 uint64_t gTime;
 
-std::string letters(size_t n) { return std::string(n, 'x'); }
+int64_t locale(size_t n) { return hcallOnLocaleChangedRpc(std::string(n, 'x').c_str()); }
+void host64(VmsgDeviceScript& s) { s.hostBoundCapacity = 64; }
+void guest72(VmsgDeviceScript& s) { s.guestBoundCapacity = 72; }
+void rawReply(VmsgDeviceScript& s, uint8_t first) {
+    s.replyMode = VmsgDeviceReplyMode::Raw;
+    s.rawReply = {first, 0xFF, 0xFF, 0xFF};
+}
+void noDevice(VmsgDeviceScript& s) { s.openErrno = ENOENT; }
 
-// Boundary rows come in threes around each limit. A locale of n letters makes
-// a request of 13 + n bytes; props with a buffer of n bytes a reply of 8 + n.
+// 715827890 bytes of 'a', then a NUL, in little memory: one MiB of 'a' mapped
+// over and over, for the rest of the run.
+const char* huge() {
+    const size_t length = 715827890, tile = 1 << 20, tail = length - length % tile;
+    const int fd = memfd_create("huge-string", 0);
+    if (ftruncate(fd, tile) != 0) return "";
+    std::memset(mmap(nullptr, tile, PROT_READ | PROT_WRITE, MAP_SHARED, fd, 0), 'a', tile);
+    auto* s = static_cast<char*>(
+        mmap(nullptr, tail + tile, PROT_NONE, MAP_PRIVATE | MAP_ANONYMOUS | MAP_NORESERVE, -1, 0));
+    for (size_t at = 0; at < tail; at += tile)
+        mmap(s + at, tile, PROT_READ, MAP_SHARED | MAP_FIXED, fd, 0);
+    mmap(s + tail, tile, PROT_READ | PROT_WRITE, MAP_PRIVATE | MAP_FIXED, fd, 0);  // own copy
+    s[length] = '\0';
+    close(fd);
+    return s;
+}
+
+// A locale of n letters makes a request of 13 + n bytes; props with a buffer
+// of n bytes a reply of 8 + n.
 TEST(HcallWire, Call_AgainstTheLimitsAndFailures_IsSentOrRefused) {
     const struct {
         const char* name;
@@ -31,24 +60,16 @@ TEST(HcallWire, Call_AgainstTheLimitsAndFailures_IsSentOrRefused) {
         int64_t want;
         size_t sent;  // exchanges that reached the host
     } rows[] = {
-        {"request one below host-bound capacity",
-         [](VmsgDeviceScript& s) { s.hostBoundCapacity = 64; },
-         [] { return int64_t(hcallOnLocaleChangedRpc(letters(50).c_str())); }, 0, 1},
-        {"request at host-bound capacity", [](VmsgDeviceScript& s) { s.hostBoundCapacity = 64; },
-         [] { return int64_t(hcallOnLocaleChangedRpc(letters(51).c_str())); }, 0, 1},
-        {"request one over host-bound capacity",
-         [](VmsgDeviceScript& s) { s.hostBoundCapacity = 64; },
-         [] { return int64_t(hcallOnLocaleChangedRpc(letters(52).c_str())); }, -1, 0},
-        // Regression: the expected reply was never compared with the
-        // guest-bound capacity, so a large buffer was read from beyond the
-        // mapping.
-        {"reply one below guest-bound capacity",
-         [](VmsgDeviceScript& s) { s.guestBoundCapacity = 72; },
+        {"request one below host-bound capacity", host64, [] { return locale(50); }, 0, 1},
+        {"request at host-bound capacity", host64, [] { return locale(51); }, 0, 1},
+        {"request one over host-bound capacity", host64, [] { return locale(52); }, -1, 0},
+        // Regression: the reply was never compared with the guest-bound
+        // capacity, so a large buffer was read from beyond the mapping.
+        {"reply one below guest-bound capacity", guest72,
          [] { return int64_t(hcallGetPropsRpc(gBuffer, 63, &gValue)); }, 0, 1},
-        {"reply at guest-bound capacity", [](VmsgDeviceScript& s) { s.guestBoundCapacity = 72; },
+        {"reply at guest-bound capacity", guest72,
          [] { return int64_t(hcallGetPropsRpc(gBuffer, 64, &gValue)); }, 0, 1},
-        {"reply one over guest-bound capacity",
-         [](VmsgDeviceScript& s) { s.guestBoundCapacity = 72; },
+        {"reply one over guest-bound capacity", guest72,
          [] { return int64_t(hcallGetPropsRpc(gBuffer, 65, &gValue)); }, -1, 0},
         // Regression: a negative buffer length became a 4 GiB copy.
         {"buffer length -1", nullptr,
@@ -57,90 +78,119 @@ TEST(HcallWire, Call_AgainstTheLimitsAndFailures_IsSentOrRefused) {
          [] { return int64_t(hcallGetTimeInfoRpc(&gTime, gBuffer, INT32_MIN)); }, -1, 0},
         {"exchange fails: no reply is read", [](VmsgDeviceScript& s) { s.sendErrno = EPIPE; },
          [] { return int64_t(hcallGetPropsRpc(gBuffer, 8, &gValue)); }, -1, 1},
-        {"launch answer is the first byte, not 0",
-         [](VmsgDeviceScript& s) {
-             s.replyMode = VmsgDeviceReplyMode::Raw;
-             s.rawReply = {0x02, 0xFF, 0xFF, 0xFF};
-         },
+        {"launch answer is the first byte, not 0", [](VmsgDeviceScript& s) { rawReply(s, 2); },
          [] { return int64_t(hcallIsAppLaunchAllowedRpc("a")); }, 1, 1},
-        {"launch answer is the first byte, 0",
-         [](VmsgDeviceScript& s) {
-             s.replyMode = VmsgDeviceReplyMode::Raw;
-             s.rawReply = {0x00, 0xFF, 0xFF, 0xFF};
-         },
+        {"launch answer is the first byte, 0", [](VmsgDeviceScript& s) { rawReply(s, 0); },
          [] { return int64_t(hcallIsAppLaunchAllowedRpc("a")); }, 0, 1},
-        {"never connected: a header-only call", [](VmsgDeviceScript& s) { s.openErrno = ENOENT; },
+        {"never connected: a header-only call", noDevice,
          [] { return int64_t(hcallLaunchOrxRpc()); }, -1, 0},
         // Chosen: a host that cannot be asked does not veto launches.
-        {"never connected: the launch query", [](VmsgDeviceScript& s) { s.openErrno = ENOENT; },
+        {"never connected: the launch query", noDevice,
          [] { return int64_t(hcallIsAppLaunchAllowedRpc("a")); }, 1, 0},
+#if !defined(__SANITIZE_THREAD__)  // which would shadow every byte of the 4 GiB of strings
+        // Regression: the total length was summed in 32 bits, so strings of
+        // several GiB wrapped it to a small number that passed the capacity
+        // test, and were then copied over the end of the shared buffer. Six
+        // strings make 46 + 6 * 715827890 = 2^32 + 90 bytes.
+        {"request whose length wraps in 32 bits", nullptr,
+         [] {
+             const char* s = huge();
+             return int64_t(hcallOnAppInstalledRpc(s, s, s, 1, s, s, s, false));
+         },
+         -1, 0},
+#endif
     };
-    LogRecorder log(XLOG_LEVEL_E);  // keeps the run quiet; lines are checked in HcallLog_test
+    LogRecorder log(XLOG_LEVEL_E);  // quiet: lines are checked in HcallLog_test
     for (const auto& row : rows) {
         SCOPED_TRACE(row.name);
         const VmsgDeviceScript script = scriptWith(row.tweak);
         HcallSession session(script);
-        ASSERT_EQ(session.connected(), script.openErrno == 0);
+        ASSERT_EQ(session.connected, script.openErrno == 0);
+        auto* request = static_cast<uint8_t*>(g_hcall.client.mHostBoundBuf);
+        if (session.connected) request[0] = 0xEE;
         EXPECT_EQ(row.call(), row.want);
         EXPECT_EQ(countEvents(VmsgDeviceEventKind::SendReceive), row.sent);
+        EXPECT_TRUE(!session.connected || row.sent > 0 || request[0] == 0xEE) << "written";
     }
 }
 
-// A string of `length` bytes of 'a' without using that much memory: one
-// small shared page run mapped over and over, then a NUL.
-class HugeString {
-  public:
-    explicit HugeString(size_t length) {
-        const size_t chunk = 1 << 20;
-        size_ = (length / chunk + 1) * chunk;
-        int fd = memfd_create("huge-string", 0);
-        if (fd < 0 || ftruncate(fd, chunk) != 0) return;
-        void* tile = mmap(nullptr, chunk, PROT_READ | PROT_WRITE, MAP_SHARED, fd, 0);
-        std::memset(tile, 'a', chunk);
-        munmap(tile, chunk);
-        base_ = static_cast<char*>(
-            mmap(nullptr, size_, PROT_NONE, MAP_PRIVATE | MAP_ANONYMOUS | MAP_NORESERVE, -1, 0));
-        for (size_t at = 0; at + chunk <= length; at += chunk)
-            mmap(base_ + at, chunk, PROT_READ, MAP_SHARED | MAP_FIXED, fd, 0);
-        const size_t tail = length - length % chunk;
-        mmap(base_ + tail, chunk, PROT_READ | PROT_WRITE, MAP_PRIVATE | MAP_ANONYMOUS | MAP_FIXED,
-             -1, 0);
-        std::memset(base_ + tail, 'a', length % chunk);
-        close(fd);
-    }
-    ~HugeString() {
-        if (base_) munmap(base_, size_);
-    }
-    const char* c_str() const { return base_; }
-
-  private:
-    char* base_ = nullptr;
-    size_t size_ = 0;
-};
-
-// Regression: the total length was summed in 32 bits, so strings of several
-// GiB wrapped it to a small number that passed the capacity test, and the
-// strings were then copied over the end of the shared buffer.
-TEST(HcallWire, Request_WhoseLengthWrapsIn32Bits_IsRefusedWithNothingWritten) {
-#if defined(__SANITIZE_THREAD__)
-    GTEST_SKIP() << "ThreadSanitizer would shadow every byte of the 4 GiB of strings";
-#endif
+TEST(HcallThreads, Calls_FromSeveralThreadsAtOnce_NeverOverlapAndEachGetsItsOwnReply) {
     LogRecorder log(XLOG_LEVEL_E);
-    // Six copies of one string: 46 + 6 * 715827890 = 2^32 + 90 bytes.
-    const size_t length = 715827890;
-    HugeString huge(length);
-    ASSERT_NE(huge.c_str(), nullptr);
-    ASSERT_EQ(std::strlen(huge.c_str()), length);
-    HcallSession session;
-    ASSERT_TRUE(session.connected());
-    std::memset(g_hcall.client.mHostBoundBuf, 0xEE, 128);
-    const char* s = huge.c_str();
+    VmsgDeviceScript script;
+    script.results = {{7, 700}, {19, 1900}, {40, 4000}};
+    script.launchAllowed = false;  // unlike the answer of a call that never reached the host
+    script.propsText = "props";
+    script.propsValue = 123;
+    script.delayUs = 20;  // holds each exchange open long enough for a collision
+    HcallSession session(script);
+    ASSERT_TRUE(session.connected);
+    // Each thread makes a call whose reply no other thread's call gets.
+    const std::vector<std::function<bool()>> callers = {
+        [] { return hcallOnOrientationChangedRpc(1) == 700; },
+        [] { return hcallOnVolumeChangedRpc(true, 3) == 1900; },
+        [] { return hcallOnImportFilesCompletedRpc(0, "/sdcard/Download") == 4000; },
+        [] { return !hcallIsAppLaunchAllowedRpc("com.example.game"); },
+        [] {
+            char buffer[32] = "";
+            int32_t value = 0;
+            return hcallGetPropsRpc(buffer, sizeof(buffer), &value) == 0 &&
+                   std::string(buffer) == "props" && value == 123;
+        },
+    };
+    constexpr int kCalls = 200;  // per thread
+    Gate start;
+    std::vector<int> wrong(callers.size(), 0);
+    std::vector<std::thread> threads;
+    for (size_t t = 0; t < callers.size(); ++t) {
+        threads.emplace_back([&, t] {
+            start.wait();
+            for (int i = 0; i < kCalls; ++i) wrong[t] += !callers[t]();
+        });
+    }
+    start.open();
+    for (std::thread& thread : threads) thread.join();
+    EXPECT_EQ(wrong, std::vector<int>(callers.size(), 0)) << "calls got another call's reply";
+    EXPECT_EQ(vmsgDeviceOverlapCount(), 0u) << "two exchanges were in flight at once";
+    const std::vector<VmsgDeviceExchange> exchanges = vmsgDeviceExchanges();
+    EXPECT_EQ(exchanges.size(), callers.size() * kCalls);
+    for (const VmsgDeviceExchange& exchange : exchanges) ASSERT_TRUE(exchange.wellFormed);
+}
 
-    EXPECT_EQ(hcallOnAppInstalledRpc(s, s, s, 1, s, s, s, false), -1);
-
-    EXPECT_EQ(vmsgDeviceExchanges().size(), 0u);
-    EXPECT_EQ(static_cast<const uint8_t*>(g_hcall.client.mHostBoundBuf)[0], 0xEE)
-        << "not even the header is written";
+// Regression: the capacities were read under the exchange lock, so a caller
+// waited behind a host call, which has no time limit. A reader spinning all
+// through connecting also shows (under ThreadSanitizer) that it races no one.
+TEST(HcallThreads, GetBufferSizes_DuringConnectAndExchanges_NeverWaits) {
+    std::atomic<bool> reading{true};
+    std::thread spinner([&] {
+        int host = 0;
+        while (reading) hcallGetBufferSizes(&host, nullptr);
+    });
+    HcallSession session(scriptWith([](VmsgDeviceScript& s) {
+        s.hostBoundCapacity = 1000;
+        s.guestBoundCapacity = 3000;
+    }));
+    reading = false;
+    spinner.join();
+    ASSERT_TRUE(session.connected);
+    Gate inHost, release, answered;
+    vmsgDeviceSetHostHook([&](uint32_t) {
+        inHost.open();
+        release.wait(2 * kGateTolerance);  // outlasts the reader's wait below
+    });
+    std::thread caller([] { hcallOnOrientationChangedRpc(1); });
+    ASSERT_TRUE(inHost.wait());
+    int sizes[2] = {0, 0};
+    std::thread reader([&] {
+        hcallGetBufferSizes(nullptr, nullptr);  // a null pointer is skipped
+        hcallGetBufferSizes(&sizes[0], &sizes[1]);
+        answered.open();
+    });
+    EXPECT_TRUE(answered.wait()) << "hcallGetBufferSizes waited for the host";
+    release.open();
+    reader.join();
+    caller.join();
+    EXPECT_EQ(sizes[0], 1000);
+    EXPECT_EQ(sizes[1], 3000);
 }
 
 }  // namespace

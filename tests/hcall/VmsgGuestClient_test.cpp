@@ -1,6 +1,5 @@
 // The message-device client against the device model: the connection as the
-// device sees it, the shared mapping, the trace and error lines, and every
-// failure the client recovers from.
+// device sees it, the shared mapping, its lines, and every failure it survives.
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
@@ -15,8 +14,6 @@
 namespace {
 
 constexpr char kConnect[] = "bool VmsgGuestClient::connect(VmsgServiceId)";
-constexpr char kGet[] = "void *VmsgGuestClient::getHostBoundBuffer(uint32_t)";
-constexpr char kProcess[] = "void *VmsgGuestClient::processRequest(void *, uint32_t)";
 constexpr VmsgServiceId kHcal = 0x6C616368;
 
 // "<function>:<line> <text>", as the lines that lead with "%s:%d" read.
@@ -24,52 +21,38 @@ std::string at(const LoggedLine& line, const std::string& text) {
     return line.function + ":" + std::to_string(line.line) + " " + text;
 }
 
-class VmsgGuestClientTest : public ::testing::Test {
-  protected:
-    void SetUp() override { vmsgDeviceReset(); }
-    void TearDown() override {
-        if (client.mFd >= 0) client.disconnect();
-        vmsgDeviceReset();
-    }
-    std::vector<LoggedLine> lines(int level) const {
-        std::vector<LoggedLine> found;
-        for (const LoggedLine& line : log.lines(XLOG_MODULE_VMSG))
-            if (line.level == level) found.push_back(line);
-        return found;
-    }
+std::vector<LoggedLine> vmsgLines(const LogRecorder& log, int level) {
+    std::vector<LoggedLine> found;
+    for (const LoggedLine& line : log.lines(XLOG_MODULE_VMSG))
+        if (line.level == level) found.push_back(line);
+    return found;
+}
 
+TEST(VmsgGuestClient, ConnectThenDisconnect_FollowTheDevice) {
     LogRecorder log;
-    VmsgGuestClient client;
-};
-
-TEST_F(VmsgGuestClientTest, Connect_WhenDeviceAnswers_OpensConnectsAndMapsAsTheDeviceSays) {
+    VmsgGuestClient c;
     VmsgDeviceScript script;
     script.hostBoundCapacity = 4096;
     script.guestBoundCapacity = 2048;
     script.spare = 0xA5A5A5A5;
     script.guestBoundOffset = 8192;
+    vmsgDeviceReset();
     vmsgDeviceConfigure(script);
-
-    ASSERT_TRUE(client.connect(kHcal));
-
-    EXPECT_GE(client.mFd, 0);
-    EXPECT_EQ(client.mMaxHostBoundSize, 4096u);
-    EXPECT_EQ(client.mMaxGuestBoundSize, 2048u);
-    EXPECT_EQ(client.mSpare, 0xA5A5A5A5u) << "the spare word is kept as the device returned it";
-    EXPECT_EQ(client.mGuestBoundOffset, 8192u);
-    EXPECT_EQ(static_cast<char*>(client.mGuestBoundBuf),
-              static_cast<char*>(client.mHostBoundBuf) + 8192);
-    EXPECT_EQ(client.mServiceName, "hcal");
-    const std::vector<VmsgDeviceEvent> events = vmsgDeviceEvents();
+    ASSERT_TRUE(c.connect(kHcal));
+    EXPECT_EQ(c.mMaxHostBoundSize, 4096u);
+    EXPECT_EQ(c.mMaxGuestBoundSize, 2048u);
+    EXPECT_EQ(c.mSpare, 0xA5A5A5A5u);
+    EXPECT_EQ(c.mGuestBoundOffset, 8192u);
+    EXPECT_EQ(static_cast<char*>(c.mGuestBoundBuf), static_cast<char*>(c.mHostBoundBuf) + 8192);
+    std::vector<VmsgDeviceEvent> events = vmsgDeviceEvents();
     ASSERT_EQ(events.size(), 2u);
     EXPECT_EQ(events[0].kind, VmsgDeviceEventKind::Open);
-    EXPECT_EQ(events[0].openFlags, O_RDWR) << "opened read-write and with no other flag";
+    EXPECT_EQ(events[0].openFlags, O_RDWR);
     EXPECT_EQ(events[1].kind, VmsgDeviceEventKind::Connect);
     EXPECT_EQ(events[1].request, 0xC0147601UL);
-    const std::array<uint8_t, 20> expectedIn = {0x68, 0x63, 0x61, 0x6C};
-    EXPECT_EQ(events[1].connectIn, expectedIn) << "service id, then 16 zero bytes";
-
-    const std::vector<LoggedLine> trace = lines(XLOG_LEVEL_I);
+    const std::array<uint8_t, 20> in = {0x68, 0x63, 0x61, 0x6C};
+    EXPECT_EQ(events[1].connectIn, in) << "service id, then 16 zero bytes";
+    std::vector<LoggedLine> trace = vmsgLines(log, XLOG_LEVEL_I);
     ASSERT_EQ(trace.size(), 2u);
     for (const LoggedLine& line : trace) {
         EXPECT_EQ(line.file, "Source/vmsg/guest/VmsgGuest");
@@ -78,39 +61,60 @@ TEST_F(VmsgGuestClientTest, Connect_WhenDeviceAnswers_OpensConnectsAndMapsAsTheD
     EXPECT_EQ(trace[0].text, at(trace[0], "called for \n")) << "the name is not yet known";
     EXPECT_EQ(trace[1].text,
               at(trace[1], "mMaxHostBoundSize 4096, mMaxGuestBoundSize 2048 service hcal"));
+
+    void* host = c.mHostBoundBuf;
+    vmsgDeviceReset();
+    log.clear();
+    c.disconnect();
+    c.disconnect();
+    events = vmsgDeviceEvents();
+    ASSERT_EQ(events.size(), 2u) << "the second disconnect reaches nothing";
+    EXPECT_EQ(events[0].kind, VmsgDeviceEventKind::Disconnect);
+    EXPECT_EQ(events[0].request, 0x7602UL);
+    EXPECT_EQ(events[1].kind, VmsgDeviceEventKind::Close);
+    EXPECT_EQ(vmsgDeviceOpenCount(), 0u);
+    EXPECT_EQ(c.mFd, -1);
+    EXPECT_EQ(c.mHostBoundBuf, host) << "the record keeps its values";
+    EXPECT_EQ(c.mMaxHostBoundSize, 4096u);
+    EXPECT_EQ(c.mServiceName, "hcal");
+    trace = log.lines(XLOG_MODULE_VMSG);
+    ASSERT_EQ(trace.size(), 2u) << "each disconnect prints its called-for line";
+    EXPECT_EQ(trace[1].function, "void VmsgGuestClient::disconnect()");
+    EXPECT_EQ(trace[1].text, at(trace[1], "called for hcal\n"));
 }
 
 // Capacity 256 when connected. processRequest refuses without a line of its
 // own: the caller's getHostBoundBuffer has already said why.
-TEST_F(VmsgGuestClientTest, Exchange_OfEachLengthAndState_IsServedOrRefused) {
+TEST(VmsgGuestClient, Exchange_OfEachLengthAndState_IsServedOrRefused) {
     enum State { Unconnected, Connected, Disconnected };
-    enum Want { Null, HostBuffer, GuestBuffer };
+    void* VmsgGuestClient::*const host = &VmsgGuestClient::mHostBoundBuf;
+    void* VmsgGuestClient::*const guest = &VmsgGuestClient::mGuestBoundBuf;
     const struct {
         const char* name;
         State state;
         bool process;  // processRequest rather than getHostBoundBuffer
         uint32_t len;
-        Want want;
+        void* VmsgGuestClient::*want;
         size_t sent;        // SEND_RECEIVE requests that reached the device
         std::string error;  // after "<signature>:<line> " or "<signature>: service <name>: "
         int sendErrno = 0;
     } rows[] = {
-        {"buffer of 0 bytes", Connected, false, 0, HostBuffer, 0, ""},
-        {"buffer one below capacity", Connected, false, 255, HostBuffer, 0, ""},
-        {"buffer at capacity", Connected, false, 256, HostBuffer, 0, ""},
-        {"buffer one over capacity", Connected, false, 257, Null, 0,
+        {"buffer of 0 bytes", Connected, false, 0, host, 0, ""},
+        {"buffer one below capacity", Connected, false, 255, host, 0, ""},
+        {"buffer at capacity", Connected, false, 256, host, 0, ""},
+        {"buffer one over capacity", Connected, false, 257, nullptr, 0,
          "len 257, mMaxHostBoundSize 256"},
-        {"request at capacity", Connected, true, 256, GuestBuffer, 1, ""},
-        {"request one over capacity", Connected, true, 257, Null, 0, ""},
-        {"request the device fails", Connected, true, 8, Null, 1,
+        {"request at capacity", Connected, true, 256, guest, 1, ""},
+        {"request one over capacity", Connected, true, 257, nullptr, 0, ""},
+        {"request the device fails", Connected, true, 8, nullptr, 1,
          "SEND_RECEIVE ioctl failed: ret -1, errno 5", EIO},
-        {"buffer before connect", Unconnected, false, 1, Null, 0, "len 1, mMaxHostBoundSize 0"},
-        {"empty buffer before connect", Unconnected, false, 0, Null, 0, "not connected"},
-        {"request before connect", Unconnected, true, 0, Null, 0, ""},
+        {"buffer before connect", Unconnected, false, 1, nullptr, 0, "len 1, mMaxHostBoundSize 0"},
+        {"empty buffer before connect", Unconnected, false, 0, nullptr, 0, "not connected"},
+        {"request before connect", Unconnected, true, 0, nullptr, 0, ""},
         // Regression: capacities outlive a disconnect, so an exchange was let
         // through onto an unmapped buffer and a closed descriptor.
-        {"buffer after disconnect", Disconnected, false, 16, Null, 0, "not connected"},
-        {"request after disconnect", Disconnected, true, 16, Null, 0, ""},
+        {"buffer after disconnect", Disconnected, false, 16, nullptr, 0, "not connected"},
+        {"request after disconnect", Disconnected, true, 16, nullptr, 0, ""},
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.name);
@@ -120,25 +124,20 @@ TEST_F(VmsgGuestClientTest, Exchange_OfEachLengthAndState_IsServedOrRefused) {
         script.sendErrno = row.sendErrno;
         vmsgDeviceReset();
         vmsgDeviceConfigure(script);
-        if (row.state != Unconnected) {
-            ASSERT_TRUE(c.connect(kHcal));
-        }
+        ASSERT_TRUE(row.state == Unconnected || c.connect(kHcal));
         if (row.state == Disconnected) c.disconnect();
-        vmsgDeviceReset();
-        vmsgDeviceConfigure(script);
-        log.clear();
-
+        LogRecorder log;
         void* got =
             row.process ? c.processRequest(nullptr, row.len) : c.getHostBoundBuffer(row.len);
-        void* want = row.want == HostBuffer ? c.mHostBoundBuf : nullptr;
-        if (row.want == GuestBuffer) want = c.mGuestBoundBuf;
-        const std::vector<LoggedLine> trace = lines(XLOG_LEVEL_I), errors = lines(XLOG_LEVEL_E);
+        const std::vector<LoggedLine> trace = vmsgLines(log, XLOG_LEVEL_I);
+        const std::vector<LoggedLine> errors = vmsgLines(log, XLOG_LEVEL_E);
         if (c.mFd >= 0) c.disconnect();
-
-        EXPECT_EQ(got, want);
+        EXPECT_EQ(got, row.want ? c.*row.want : nullptr);
         EXPECT_EQ(countEvents(VmsgDeviceEventKind::SendReceive), row.sent);
         ASSERT_EQ(trace.size(), 1u);
-        EXPECT_EQ(trace[0].function, row.process ? kProcess : kGet);
+        EXPECT_EQ(trace[0].function, row.process
+                                         ? "void *VmsgGuestClient::processRequest(void *, uint32_t)"
+                                         : "void *VmsgGuestClient::getHostBoundBuffer(uint32_t)");
         EXPECT_EQ(trace[0].text, at(trace[0], "called for " + c.mServiceName + "\n"));
         ASSERT_EQ(errors.size(), row.error.empty() ? 0u : 1u);
         if (errors.empty()) continue;
@@ -150,39 +149,12 @@ TEST_F(VmsgGuestClientTest, Exchange_OfEachLengthAndState_IsServedOrRefused) {
     }
 }
 
-TEST_F(VmsgGuestClientTest, Disconnect_ReleasesDeviceOnceAndKeepsTheRecord) {
-    ASSERT_TRUE(client.connect(kHcal));
-    void* host = client.mHostBoundBuf;
-    vmsgDeviceReset();
-    log.clear();
-
-    client.disconnect();
-    client.disconnect();
-
-    const std::vector<VmsgDeviceEvent> events = vmsgDeviceEvents();
-    ASSERT_EQ(events.size(), 2u) << "the second disconnect reaches nothing";
-    EXPECT_EQ(events[0].kind, VmsgDeviceEventKind::Disconnect);
-    EXPECT_EQ(events[0].request, 0x7602UL);
-    EXPECT_EQ(events[1].kind, VmsgDeviceEventKind::Close);
-    EXPECT_EQ(vmsgDeviceOpenCount(), 0u);
-    EXPECT_EQ(client.mFd, -1);
-    EXPECT_EQ(client.mHostBoundBuf, host) << "pointers keep their values";
-    EXPECT_EQ(client.mMaxHostBoundSize, 65536u) << "sizes keep their values";
-    EXPECT_EQ(client.mServiceName, "hcal");
-    const std::vector<LoggedLine> trace = log.lines(XLOG_MODULE_VMSG);
-    ASSERT_EQ(trace.size(), 2u) << "each disconnect prints its called-for line";
-    EXPECT_EQ(trace[1].function, "void VmsgGuestClient::disconnect()");
-    EXPECT_EQ(trace[1].text, at(trace[1], "called for hcal\n"));
-}
-
-// The connection failures, one row each, on a client whose earlier connect
-// to "abcd" failed: the error line, the client left unconnected with no
-// descriptor behind, the new name kept, and the out-words of a CONNECT that
-// succeeded kept. The last two rows guard regressions: a mapping length that
-// wrapped in 32 bits mapped a sliver, and a host-bound capacity beyond the
-// mapping let requests run past its end; neither layout reaches mmap, so
-// neither may say that mmap failed.
-TEST_F(VmsgGuestClientTest, Connect_WhenAStepFails_ReportsAndStaysUnconnected) {
+// Each failing step, on a client whose earlier connect to "abcd" failed: the
+// error line, no descriptor left behind, the new name kept, and the out-words
+// of a CONNECT that succeeded kept. Regressions: a mapping length that wrapped
+// in 32 bits mapped a sliver, and a host-bound capacity beyond the mapping let
+// requests run past its end; neither layout may reach mmap.
+TEST(VmsgGuestClient, Connect_WhenAStepFails_ReportsAndStaysUnconnected) {
     const std::string refused =
         "connection ioctl failed: ret -1, errno " + std::to_string(ECONNREFUSED);
     const std::string layout = "hcal: impossible buffer layout: mMaxHostBoundSize ";
@@ -227,14 +199,14 @@ TEST_F(VmsgGuestClientTest, Connect_WhenAStepFails_ReportsAndStaysUnconnected) {
         script.hostBoundCapacity = 4096;
         if (row.tweak) row.tweak(script);
         vmsgDeviceConfigure(script);
-        log.clear();
-
+        LogRecorder log;
         EXPECT_FALSE(c.connect(row.id));
         EXPECT_EQ(c.mFd, -1);
         EXPECT_EQ(vmsgDeviceOpenCount(), 0u) << "the device is closed again";
         EXPECT_EQ(c.mServiceName, row.line.substr(0, row.line.find(':')));
         EXPECT_EQ(c.mMaxHostBoundSize, row.hostBoundSize);
-        const std::vector<LoggedLine> trace = lines(XLOG_LEVEL_I), errors = lines(XLOG_LEVEL_E);
+        const std::vector<LoggedLine> trace = vmsgLines(log, XLOG_LEVEL_I);
+        const std::vector<LoggedLine> errors = vmsgLines(log, XLOG_LEVEL_E);
         ASSERT_FALSE(trace.empty());
         EXPECT_EQ(trace[0].text, at(trace[0], "called for abcd\n")) << "the earlier call's name";
         ASSERT_EQ(errors.size(), 1u);

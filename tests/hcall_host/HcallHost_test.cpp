@@ -1,6 +1,6 @@
 // The host half beyond the golden corpus (tests/hcall/HcallGolden_test.cpp):
-// requests it must refuse and why, replies no proper host builds, and what
-// the dispatcher hands a handler.
+// requests it refuses and why, replies no proper host builds, and what the
+// dispatcher hands a handler.
 
 #include "hcall/host/HcallHost.h"
 
@@ -30,48 +30,38 @@ constexpr char kProps[] = "01000000 14000000 08000000 08000000 04000000";
 TEST(HcallHost, Parse_OfRequestsBreakingARule_SaysWhich) {
     const struct {
         const char* request;
-        HcallLimits limits;
-        const char* problem;  // "" for a request that is well formed
+        const char* problem;           // "" for a request that is well formed
+        uint32_t host = 0, guest = 0;  // capacities, 0 for none
     } rows[] = {
-        {"0C000000 1000", {}, "request of 6 bytes is shorter than the header"},
-        {"00000000 08000000", {}, "unknown operation code 0"},
-        {"2C000000 08000000", {}, "unknown operation code 44"},
-        {"10000000 04000000", {}, "totalLength 4 is shorter than the header"},
-        {"07000000 0C000000 01000000",
-         {11, 0},
-         "totalLength 12 exceeds the host-bound capacity 11"},
-        {"07000000 0C000000 01000000", {12, 0}, ""},
-        {"07000000 0C000000", {}, "totalLength 12 runs past the 8 bytes received"},
-        {"07000000 08000000", {}, "parameter at offset 8 runs past totalLength 8"},
+        {"0C000000 1000", "request of 6 bytes is shorter than the header"},
+        {"00000000 08000000", "unknown operation code 0"},
+        {"2C000000 08000000", "unknown operation code 44"},
+        {"10000000 04000000", "totalLength 4 is shorter than the header"},
+        {"07000000 0C000000 01000000", "totalLength 12 exceeds the host-bound capacity 11", 11},
+        {"07000000 0C000000 01000000", "", 12},
+        {"07000000 0C000000", "totalLength 12 runs past the 8 bytes received"},
+        {"07000000 08000000", "parameter at offset 8 runs past totalLength 8"},
         {"0C000000 10000000 00000000 61626300",
-         {},
          "string count 0 at offset 8 leaves no room for the NUL"},
         {"0C000000 10000000 09000000 61626300",
-         {},
          "string count 9 at offset 8 runs past totalLength 16"},
-        {"0C000000 10000000 04000000 61626364", {}, "string at offset 8 lacks its terminating NUL"},
-        {"0C000000 10000000 04000000 61006300",
-         {},
-         "string at offset 8 holds a NUL before its end"},
-        {"09000000 0C000000 02000000", {}, "bool field at offset 8 holds 0x00000002"},
-        {"09000000 0C000000 00010000", {}, "bool field at offset 8 holds 0x00000100"},
+        {"0C000000 10000000 04000000 61626364", "string at offset 8 lacks its terminating NUL"},
+        {"0C000000 10000000 04000000 61006300", "string at offset 8 holds a NUL before its end"},
+        {"09000000 0C000000 02000000", "bool field at offset 8 holds 0x00000002"},
+        {"09000000 0C000000 00010000", "bool field at offset 8 holds 0x00000100"},
         {"01000000 14000000 08000000 08000000 08000000",
-         {},
          "i32* size field at offset 16 is 8, not 4"},
-        {"05000000 14000000 04000000 08000000 08000000",
-         {},
-         "u64* size field at offset 8 is 4, not 8"},
-        {"10000000 0C000000 00000000", {}, "totalLength 12 but the fields end at 8"},
-        {"01000000 14000000 FFFFFFFF FFFFFFFF 04000000", {}, "buffer length -1 is negative"},
+        {"05000000 14000000 04000000 08000000 08000000", "u64* size field at offset 8 is 4, not 8"},
+        {"10000000 0C000000 00000000", "totalLength 12 but the fields end at 8"},
+        {"01000000 14000000 FFFFFFFF FFFFFFFF 04000000", "buffer length -1 is negative"},
         {"01000000 14000000 08000000 10000000 04000000",
-         {},
          "buffer capacity 8 differs from its length parameter 16"},
-        {kProps, {0, 15}, "reply of 16 bytes exceeds the guest-bound capacity 15"},
-        {kProps, {20, 16}, ""},
+        {kProps, "reply of 16 bytes exceeds the guest-bound capacity 15", 0, 15},
+        {kProps, "", 20, 16},
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.request);
-        const HcallRequest r = parse(row.request, row.limits);
+        const HcallRequest r = parse(row.request, {row.host, row.guest});
         EXPECT_EQ(hcallFaultText(r), row.problem);
         EXPECT_EQ(r.ok(), *row.problem == '\0');
         EXPECT_EQ(hcallCallText(r).rfind("!malformed ", 0) == 0, !r.ok()) << "refusals are marked";
