@@ -1,8 +1,6 @@
-// Stands in for a process that has run out of threads: this program's
-// pthread_create is replaced by one that, while a ThreadCreateFault is in
-// scope, lets a given number of creations through and then fails the rest
-// with EAGAIN, as the system does at its thread limit. It also counts every
-// creation. Include it in exactly one file of a test program.
+// Replaces pthread_create: while a ThreadCreateFault is in scope, the first
+// `succeedFirst` creations go through and the rest fail with EAGAIN, as at the
+// system's thread limit. Include it in exactly one file of a test program.
 #pragma once
 
 #include <dlfcn.h>
@@ -12,8 +10,7 @@
 #include <cerrno>
 
 namespace threadfault {
-// Creations still allowed before failures begin; below 0, no fault.
-inline std::atomic<int> allowed{-1};
+inline std::atomic<int> allowed{-1};  // below 0: no fault
 inline std::atomic<int> attempts{0};
 }  // namespace threadfault
 

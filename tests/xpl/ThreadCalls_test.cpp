@@ -1,12 +1,13 @@
-// The pool and the timer service when a thread cannot be created, as at the
-// system's thread limit. A program of its own: it replaces pthread_create.
-// The timer service is process wide: each test takes it as it finds it.
+// The pool and the timer service as seen from the C library's thread calls.
+// A program of its own: it replaces pthread_create, pthread_cond_signal and
+// pthread_cond_broadcast for the whole process.
+#include <dlfcn.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <pthread.h>
 
-#include <atomic>
+#include <climits>
 #include <memory>
-#include <string>
 #include <thread>
 
 #include "support/Gate.h"
@@ -14,6 +15,23 @@
 #include "threading/ThreadCreateFault.h"
 #include "xpl/XthrPool.h"
 #include "xpl/Xtimer.h"
+
+namespace {
+
+std::atomic<pthread_cond_t*> gWatched{nullptr};
+std::atomic<int> gWakes{0};
+
+int countAndCall(const char* name, pthread_cond_t* cond) {
+    if (cond == gWatched.load()) ++gWakes;
+    using Call =
+        int (*)(pthread_cond_t*);  // the default version, which std::condition_variable uses
+    return reinterpret_cast<Call>(dlsym(RTLD_NEXT, name))(cond);
+}
+
+}  // namespace
+
+extern "C" int pthread_cond_signal(pthread_cond_t* c) { return countAndCall(__func__, c); }
+extern "C" int pthread_cond_broadcast(pthread_cond_t* c) { return countAndCall(__func__, c); }
 
 namespace {
 
@@ -25,34 +43,24 @@ TEST(ThreadCreateFailure,
     ThreadPool pool;
     {
         ThreadCreateFault fault(/*succeedFirst=*/2);
-        EXPECT_EQ(xthrPoolInit(&pool, 4), XERR_AGAIN) << "the creation error is the result";
+        EXPECT_EQ(xthrPoolInit(&pool, 4), XERR_AGAIN);
     }
     EXPECT_EQ(recorder.texts(XLOG_MODULE_XTHR),
-              std::vector<std::string>{"xthrPoolInit: started 2 of 4 workers, error 11\n"})
-        << "native_init ignores the result, so the line is all that tells of it";
+              std::vector<std::string>{"xthrPoolInit: started 2 of 4 workers, error 11\n"});
     EXPECT_EQ(recorder.lines(XLOG_MODULE_XTHR).at(0).level, XLOG_LEVEL_E);
     EXPECT_EQ(pool.numThreads * 10 + pool.numActive, 42) << "4 asked for, 2 to wait for";
-
     // Both started workers are live: each holds a task until the other runs.
     std::atomic<int> runs{0};
     Gate first, second;
-    xthrPoolAddTask(&pool, [&] {
-        first.open();
-        runs += second.wait();
-    });
-    xthrPoolAddTask(&pool, [&] {
-        second.open();
-        runs += first.wait();
-    });
+    xthrPoolAddTask(&pool, [&] { first.open(), runs += second.wait(); });
+    xthrPoolAddTask(&pool, [&] { second.open(), runs += first.wait(); });
     xthrPoolFini(&pool);
-    EXPECT_EQ(runs, 2) << "the started workers run tasks side by side";
-    EXPECT_EQ(pool.numActive, 0);
+    EXPECT_EQ(runs * 10 + pool.numActive, 20);
 }
 
 // Regression: a failed creation left the lock held or the flag set with no
 // thread behind it, so every later callback was silently lost.
 TEST(ThreadCreateFailure, TimerStart_WhenThreadCannotBeCreated_LeavesServiceUntouched) {
-    if (g_xtimer->threadStarted) GTEST_SKIP() << "the timer thread already runs in this process";
     auto ran = std::make_shared<EventLog>();
     {
         ThreadCreateFault fault(/*succeedFirst=*/0);
@@ -62,10 +70,8 @@ TEST(ThreadCreateFailure, TimerStart_WhenThreadCannotBeCreated_LeavesServiceUnto
     EXPECT_EQ(g_xtimer->threadStarted, 0) << "no thread, so the next call must try again";
     EXPECT_TRUE(g_xtimer->timers.empty()) << "a refused callback is not left pending";
     g_xtimer->mutex.unlock();
-
-    // Once a thread can be created, callbacks run, all on the one thread.
     const std::thread::id caller = std::this_thread::get_id();
-    const std::function<void()> record = [ran, caller] {
+    const auto record = [ran, caller] {
         ran->record(std::this_thread::get_id() == caller ? "caller" : "timer thread");
     };
     ASSERT_EQ(xtimerStart(0, record), XERR_SUCCESS);
@@ -75,6 +81,30 @@ TEST(ThreadCreateFailure, TimerStart_WhenThreadCannotBeCreated_LeavesServiceUnto
     ASSERT_TRUE(ran->waitForCount(10));
     EXPECT_EQ(threadCreateAttempts(), attempts) << "the thread from the first call serves all";
     EXPECT_THAT(ran->events(), ::testing::Each("timer thread"));
+}
+
+// Any other wake-up would find the same head and wait again. Counted from an
+// empty queue, whether or not the thread exists yet.
+TEST(XtimerWake, Start_WhenNewCallbackIsNotTheEarliest_LeavesTheTimerThreadAsleep) {
+    for (bool idle = false; !idle; std::this_thread::yield()) {
+        std::lock_guard<std::mutex> lock(g_xtimer->mutex);
+        idle = g_xtimer->timers.empty();
+    }
+    gWatched = g_xtimer->cond.native_handle();
+    constexpr long long kSecond = 1000000;
+    const struct {
+        long long delay;
+        int wakes;
+    } rows[] = {
+        {LLONG_MAX, 1},  // the only one pending is the earliest
+        {LLONG_MAX, 0},  // an equal expiry goes behind the head
+        {120 * kSecond, 1}, {240 * kSecond, 0}, {60 * kSecond, 1}, {90 * kSecond, 0},
+    };
+    for (const auto& row : rows) {
+        const int before = gWakes;
+        ASSERT_EQ(xtimerStart(row.delay, [] {}), XERR_SUCCESS);
+        EXPECT_EQ(gWakes - before, row.wakes) << row.delay;
+    }
 }
 
 }  // namespace
