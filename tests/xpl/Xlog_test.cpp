@@ -1,11 +1,10 @@
-// The logger core: the record as loaded, the default print's two sinks (the
-// kernel log through the kernel-log guard's redirection to a file of the
-// test's own), the fatal statement. A program of its own, which prints only in
-// children: the kernel-log stream is opened once per process.
+// The logger core. A program of its own, which prints only in children: the
+// kernel-log stream (redirected by the kernel-log guard) is opened once per process.
 #include "xpl/Xlog.h"
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <csignal>
 #include <cstdlib>
 #include <string>
@@ -25,11 +24,9 @@ struct AtLoad {
     XlogLogger* logger = xlogGetLogger();
     bool onlyErrorsPass = true;
     AtLoad() {
-        for (int m = 0; m < XLOG_NUM_MODULES; ++m) {
-            onlyErrorsPass = onlyErrorsPass && logger->shouldLog(m, -1) &&
-                             logger->shouldLog(m, XLOG_LEVEL_E) &&
-                             !logger->shouldLog(m, XLOG_LEVEL_W);
-        }
+        for (int m = 0; m < XLOG_NUM_MODULES; ++m)
+            onlyErrorsPass &= logger->shouldLog(m, -1) && logger->shouldLog(m, XLOG_LEVEL_E) &&
+                              !logger->shouldLog(m, XLOG_LEVEL_W);
     }
 } g_atLoad;
 
@@ -48,26 +45,23 @@ TEST(Xlog, Print_SendsEachMessageAsFormattedToBothSinksFlushedAndOnOneStream) {
     ChildOutcome outcome = runInChild([&]() -> std::string {
         setenv("HOSTCALL_TEST_KMSG", (dir / "kmsg").c_str(), 1);
         AndroidLogCapture capture;
-        std::string want, priorities;
+        std::string want, got;
         for (int level = -1; level <= 5; ++level) {
             xlogPrint(level, XLOG_MODULE_HCALL, "f", "g", 1, "%d:%lld;", level, 1LL << 40);
             want += std::to_string(level) + ":1099511627776;";
             if (dir.read("kmsg") != want) return "kernel log, flushed at once: " + dir.read("kmsg");
-            priorities += std::to_string(capture.lines().back().priority);
-            if (capture.lines().back().text != want.substr(want.rfind(';', want.size() - 2) + 1))
-                return "Android log: " + capture.lines().back().text;
         }
-        if (priorities != "2654322") return "priorities for levels -1 to 5: " + priorities;
+        for (const AndroidLogLine& line : capture.lines()) got += line.text;
+        for (const AndroidLogLine& line : capture.lines()) got += std::to_string(line.priority);
+        if (got != want + "2654322") return "Android log: " + got;  // V E W I D V V
         std::vector<std::thread> threads;
         for (int i = 0; i < 8; ++i)
             threads.emplace_back([i] { xlogPrint(1, XLOG_MODULE_XTHR, "f", "g", 1, "|%d", i); });
         for (std::thread& thread : threads) thread.join();
         // A second opening in "w+" mode would have cut what came before.
         const std::string written = dir.read("kmsg");
-        for (int i = 0; i < 8; ++i) {
-            if (written.find("|" + std::to_string(i)) == std::string::npos) return written;
-        }
-        return written.rfind(want, 0) == 0 && capture.lines().size() == 15 ? "" : written;
+        const bool all = std::count(written.begin(), written.end(), '|') == 8;
+        return all && written.rfind(want, 0) == 0 && capture.lines().size() == 15 ? "" : written;
     });
     EXPECT_TRUE(outcome.ok()) << outcome.describe();
 }
