@@ -5,7 +5,6 @@
 #include <pthread.h>
 
 #include <climits>
-#include <memory>
 #include <thread>
 
 #include "support/Gate.h"
@@ -56,9 +55,7 @@ TEST(ThreadCreateFailure,
 }
 
 // Regression: a failed creation left the lock held or the flag set with no
-// thread behind it, so every later callback was silently lost. Then the one
-// thread is woken only when a new callback becomes the earliest: any other
-// wake-up would find the same head and wait again.
+// thread behind it. Once made, the thread is woken only for a new head.
 TEST(XtimerThread, Start_MakesTheThreadOnceItCanAndWakesItOnlyForANewHead) {
     auto ran = std::make_shared<EventLog>();
     const int attempts = threadCreateAttempts();
@@ -78,18 +75,16 @@ TEST(XtimerThread, Start_MakesTheThreadOnceItCanAndWakesItOnlyForANewHead) {
     }
     gWatched = g_xtimer->cond.native_handle();
     constexpr long long kSecond = 1000000;
-    const struct {
-        long long delay;
-        int wakes;
-    } rows[] = {
+    const std::pair<long long, int> rows[] = {
+        // delay, wake-ups
         {LLONG_MAX, 1},  // the only one pending is the earliest
         {LLONG_MAX, 0},  // an equal expiry goes behind the head
         {120 * kSecond, 1}, {240 * kSecond, 0}, {60 * kSecond, 1}, {90 * kSecond, 0},
     };
-    for (const auto& row : rows) {
+    for (const auto& [delay, wakes] : rows) {
         const int before = gWakes;
-        ASSERT_EQ(xtimerStart(row.delay, [] {}), XERR_SUCCESS);
-        EXPECT_EQ(gWakes - before, row.wakes) << row.delay;
+        ASSERT_EQ(xtimerStart(delay, [] {}), XERR_SUCCESS);
+        EXPECT_EQ(gWakes - before, wakes) << delay;
     }
 }
 

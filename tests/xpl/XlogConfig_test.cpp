@@ -1,13 +1,11 @@
-// Log configuration and the support library's start-up: tables, levels and
-// level specifications, the log file and its rotation, the time stamp's bounds.
+// Log configuration and the support library's start-up.
 #include <gtest/gtest.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cctype>
 #include <cstring>
-#include <string>
+#include <filesystem>
 
 #include "support/AndroidLogCapture.h"
 #include "support/ChildProcess.h"
@@ -20,21 +18,7 @@ namespace {
 
 int levelOf(int module) { return g_xlog->modules[module].level; }
 
-long long sizeOf(const std::string& path) {
-    struct stat info {};
-    return stat(path.c_str(), &info) == 0 ? static_cast<long long>(info.st_size) : -1;
-}
-
-class XlogConfig : public ::testing::Test {
-  protected:
-    void SetUp() override {
-        const XlogLogger defaults{xlogShouldLog, xlogPrint};
-        ASSERT_EQ(xerrLibInit() + xlogLibInit(&defaults, "", ""), XERR_SUCCESS);
-    }
-    TempDir dir_;
-};
-
-TEST_F(XlogConfig, LibInitAndSetLevels_FixTheLevelsThenApplyTokensUntilAMalformedOne) {
+TEST(XlogConfig, LibInitAndSetLevels_FixTheLevelsThenApplyTokensUntilAMalformedOne) {
     AndroidLogCapture capture;
     ASSERT_EQ(xlogLibInit(nullptr, "", "*:I"), XERR_SUCCESS);
     EXPECT_TRUE(capture.lines().empty()) << "XLOG is at I when its D lines are tested";
@@ -65,12 +49,11 @@ TEST_F(XlogConfig, LibInitAndSetLevels_FixTheLevelsThenApplyTokensUntilAMalforme
     }
 }
 
-// Each case in a child put back to the state at load (no translations, the
-// logger record unfilled). What the logger printed, the caller's lines first,
-// then the Android log's (digits dropped), must be `lines`; a later
-// xlogSetLevels("*:V") adds its own line where XLOG's D lines pass.
-TEST_F(XlogConfig, XplLibInit_StartsCodesThenLoggerAndStopsAtAFailure) {
-    dir_.write("plain", "");
+// Each row in a child put back to the state at load. `lines`: the caller's
+// logger's, then the Android log's less digits; "*:V" then shows XLOG's D lines.
+TEST(XlogConfig, XplLibInit_StartsCodesThenLoggerAndStopsAtAFailure) {
+    TempDir dir;
+    dir.write("plain", "");
     const struct {
         bool callersLogger;
         std::string logFile;
@@ -82,7 +65,7 @@ TEST_F(XlogConfig, XplLibInit_StartsCodesThenLoggerAndStopsAtAFailure) {
          "D Source/xpl/Xlog xerr_t xlogLibInit(const XlogLogger *, const string &, const string "
          "&): xlog inited using logger\n"
          "D Source/xpl/Xlog xerr_t xlogSetLevels(const string &): Change log levels with: *:V\n"},
-        {false, dir_ / "plain/log", XERR_NOTDIR,
+        {false, dir / "plain/log", XERR_NOTDIR,
          "6 FATAL: DEBUG BREAK: Source/xpl/Xlog: xlogLibInit()\n"},
     };
     for (const auto& row : rows) {
@@ -122,29 +105,30 @@ TEST_F(XlogConfig, XplLibInit_StartsCodesThenLoggerAndStopsAtAFailure) {
     }
 }
 
-TEST_F(XlogConfig, SetFile_AppendsAndRotatesFromTheThresholdOn) {
-    const std::string logFile = dir_ / "logs/service.log";  // the folder is made
+TEST(XlogConfig, SetFile_AppendsAndRotatesFromTheThresholdOn) {
+    TempDir dir;
+    const std::string logFile = dir / "logs/service.log";  // the folder is made
     for (const char* text : {"one\n", "two\n"}) {
         ASSERT_EQ(xlogSetFile(logFile), XERR_SUCCESS);
         ASSERT_EQ(write(g_xlog->file.fd, text, 4), 4);
     }
-    EXPECT_EQ(sizeOf(logFile), 8) << "appended, never truncated";
+    EXPECT_EQ(std::filesystem::file_size(logFile), 8) << "appended, never truncated";
     const int fd = g_xlog->file.fd;
     EXPECT_EQ(xlogSetFile(""), XERR_SUCCESS);
     EXPECT_EQ(g_xlog->fileName + std::to_string(g_xlog->file.fd), logFile + std::to_string(fd))
         << "an empty name changes nothing";
     constexpr long long kRotateSize = 10485760;
     for (long long size : {kRotateSize - 1, kRotateSize, kRotateSize + 1}) {
-        const std::string name = dir_ / std::to_string(size);
+        const std::string name = dir / std::to_string(size);
         for (const auto& [suffix, length] : {std::pair{"", size}, {".1", 5LL}, {".2", 9LL}}) {
-            dir_.write(std::to_string(size) + suffix, "");
+            dir.write(std::to_string(size) + suffix, "");
             ASSERT_EQ(truncate((name + suffix).c_str(), length), 0);  // sparse: no disk space
         }
         ASSERT_EQ(xlogSetFile(name), XERR_SUCCESS);
         const bool rotated = size >= kRotateSize;  // the file becomes .1, .1 becomes .2
-        EXPECT_EQ(sizeOf(name), rotated ? 0 : size) << size;
-        EXPECT_EQ(sizeOf(name + ".1"), rotated ? size : 5) << size;
-        EXPECT_EQ(sizeOf(name + ".2"), rotated ? 5 : 9) << size;
+        EXPECT_EQ(std::filesystem::file_size(name), rotated ? 0 : size) << size;
+        EXPECT_EQ(std::filesystem::file_size(name + ".1"), rotated ? size : 5) << size;
+        EXPECT_EQ(std::filesystem::file_size(name + ".2"), rotated ? 5 : 9) << size;
     }
     // Regression: a size of 0 or less became a huge size_t and the stamp was
     // written past the caller's buffer.

@@ -6,10 +6,7 @@
 
 #include <algorithm>
 #include <csignal>
-#include <cstdlib>
-#include <string>
 #include <thread>
-#include <vector>
 
 #include "support/AndroidLogCapture.h"
 #include "support/ChildProcess.h"

@@ -8,19 +8,16 @@
 namespace {
 
 TEST(Xstr, CaseInsensitiveCompare_FoldsAsciiLettersOnly) {
-    const struct {
-        const char *a, *b;
-        int count, sign;  // count below 0: xstr_icmp, else xstr_nicmp over count
-    } rows[] = {
+    const std::tuple<const char*, const char*, int, int> rows[] = {
         {"AZ", "az", -1, 0},      {"@", "`", -1, -1},        {"[", "{", -1, -1},
         {"[", "A", -1, -1},       {"abc", "ABD", -1, -1},    {"a", "ab", -1, -1},
         {"ab", "a", -1, 1},       {"\xC3\xA9", "a", -1, -1},  // a high byte is below ASCII
         {"\xC9", "\xE9", -1, -1}, {"abcX", "ABCy", 3, 0},    {"abcX", "ABCy", 4, -1},
         {"x", "y", 0, 0},         {"ab", "AB", 10, 0},
     };
-    for (const auto& r : rows) {
-        int got = r.count < 0 ? xstr_icmp(r.a, r.b) : xstr_nicmp(r.a, r.b, r.count);
-        EXPECT_EQ((got > 0) - (got < 0), r.sign) << r.a << " " << r.b << " " << r.count;
+    for (const auto& [a, b, count, sign] : rows) {  // count below 0: xstr_icmp
+        int got = count < 0 ? xstr_icmp(a, b) : xstr_nicmp(a, b, count);
+        EXPECT_EQ((got > 0) - (got < 0), sign) << a << " " << b << " " << count;
     }
 }
 
@@ -31,11 +28,7 @@ TEST(Xstr, Predicates_CompareTextsAsTheirRulesSay) {
                ew = xstrEndsWith, ewi = xstrEndsWithIgnoreCase, has = xstrContains,
                hasi = xstrContainsIgnoreCase;
     // Equality ends at a NUL; the search goes past one.
-    const struct {
-        Test test;
-        std::string s, arg;
-        bool want;
-    } rows[] = {
+    const std::tuple<Test, std::string, std::string, bool> rows[] = {
         {eqi, "Hello", "hELLO", true},   {eqi, "Hello", "Hell", false},
         {eqi, "ab\0x"s, "AB\0y"s, true}, {sw, "abc", "ab", true},
         {sw, "ab", "abc", false},        {sw, "ABC", "ab", false},
@@ -45,15 +38,11 @@ TEST(Xstr, Predicates_CompareTextsAsTheirRulesSay) {
         {ewi, "a.txz", ".TXT", false},   {has, "Hello", "LL", false},
         {hasi, "Hello", "LL", true},     {has, "a\0bc"s, "bc", true},
     };
-    for (size_t i = 0; i < std::size(rows); ++i)
-        EXPECT_EQ(rows[i].test(rows[i].s, rows[i].arg), rows[i].want) << "row " << i;
+    for (const auto& [test, s, arg, want] : rows) EXPECT_EQ(test(s, arg), want) << s << "," << arg;
 }
 
 TEST(Xstr, TrimFoldAndSplit_ChangeOnlyWhiteSpaceAndAsciiLetters) {
-    const struct {
-        std::string (*transform)(const std::string&);
-        std::string in, want;
-    } rows[] = {
+    const std::tuple<std::string (*)(const std::string&), std::string, std::string> rows[] = {
         {xstrTrim, " \t a b\r\n", "a b"},
         {xstrTrim, "\v\f x \v\f", "x"},
         {xstrTrim, "\b\xA0x\x0E", "\b\xA0x\x0E"},  // neighbours of white space, a high byte
@@ -61,18 +50,14 @@ TEST(Xstr, TrimFoldAndSplit_ChangeOnlyWhiteSpaceAndAsciiLetters) {
         {xstrToLower, "@AZ[`az{\xC9", "@az[`az{\xC9"},
         {xstrToUpper, "@AZ[`az{\xE9", "@AZ[`AZ{\xE9"},
     };
-    for (const auto& r : rows) EXPECT_EQ(r.transform(r.in), r.want) << r.in;
+    for (const auto& [transform, in, want] : rows) EXPECT_EQ(transform(in), want) << in;
     // Empty fields are dropped, but the last one always stays.
-    const struct {
-        const char *s, *delims;
-        std::vector<std::string> want;
-    } splits[] = {
+    const std::tuple<const char*, const char*, std::vector<std::string>> splits[] = {
         {" a , b ", ",", {"a", "b"}}, {"a,,b", ",", {"a", "b"}},         {",a", ",", {"a"}},
         {"a,", ",", {"a", ""}},       {"a, ,b", ",", {"a", "", "b"}},    {"", ",", {""}},
         {",,,", ",", {""}},           {"a, b,c", ", ", {"a", "b", "c"}}, {" x ", "", {"x"}},
     };
-    for (const auto& r : splits)
-        EXPECT_EQ(xstrSplit(r.s, r.delims), r.want) << r.s << "@" << r.delims;
+    for (const auto& [s, delims, want] : splits) EXPECT_EQ(xstrSplit(s, delims), want) << s;
 }
 
 // Regression (last line): an encoding error made the first pass report -1,

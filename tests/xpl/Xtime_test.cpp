@@ -1,14 +1,11 @@
-// The library's time base (local wall clock read as UTC) in fixed zones, each
-// in a child of its own, with the logger's offset and time stamp made from it.
+// The time base (local wall clock read as UTC) in fixed zones, each in a child,
+// with the logger's offset and time stamp made from it.
 #include "xpl/Xtime.h"
 
 #include <gtest/gtest.h>
 #include <sys/time.h>
 
-#include <algorithm>
-#include <cstdio>
 #include <ctime>
-#include <string>
 
 #include "support/ChildProcess.h"
 #include "xpl/Xlog.h"
@@ -26,15 +23,13 @@ long long localWallClock() {
     return (tv.tv_sec + local.tm_gmtoff) * kSecond + tv.tv_usec;
 }
 
-// A base value as the logger stamps it, followed by `suffix`.
-std::string stampOf(long long t, const char* suffix) {
+// A base value as the logger stamps it, less the zone's offset.
+std::string stampOf(long long t) {
     const time_t seconds = static_cast<time_t>(t / kSecond);
     struct tm broken {};
-    gmtime_r(&seconds, &broken);
     char text[64];
-    size_t length = strftime(text, sizeof(text), "%Y-%m-%d %H:%M:%S", &broken);
-    std::snprintf(text + length, sizeof(text) - length, ".%03d%s",
-                  static_cast<int>(t % kSecond / 1000), suffix);
+    size_t length = strftime(text, sizeof(text), "%F %T", gmtime_r(&seconds, &broken));
+    snprintf(text + length, sizeof(text) - length, ".%03d", static_cast<int>(t % kSecond / 1000));
     return text;
 }
 
@@ -45,7 +40,7 @@ TEST(Xtime, BaseConversionAndLogStamp_FollowTheZone) {
     const struct {
         const char* tz;
         long long standard, winter, summer;  // how far local time leads UTC
-        const char* suffix;                  // the logger's offset: the standard one
+        const char* offset;                  // the logger's: the standard one
     } rows[] = {
         {"UTC0", 0, 0, 0, "-0000"},
         {"IST-5:30", 19800 * kSecond, 19800 * kSecond, 19800 * kSecond, "+0530"},
@@ -55,8 +50,7 @@ TEST(Xtime, BaseConversionAndLogStamp_FollowTheZone) {
     };
     for (const auto& row : rows) {
         ChildOutcome outcome = runWithTimeZone(row.tz, [&]() -> std::string {
-            long long before = localWallClock();
-            long long now = xtimeNow();
+            long long before = localWallClock(), now = xtimeNow();
             if (now < before || now > localWallClock()) return "xtimeNow is not the wall clock";
             // While daylight saving is in force the base is read as standard time.
             for (const auto& [utc, lead] : {std::pair{winter, row.winter}, {summer, row.summer}}) {
@@ -66,8 +60,8 @@ TEST(Xtime, BaseConversionAndLogStamp_FollowTheZone) {
             char stamp[64];
             before = localWallClock();
             xlogCurrentTime(stamp, sizeof(stamp));
-            const std::string first = stampOf(before, row.suffix);
-            const std::string last = stampOf(localWallClock(), row.suffix);
+            const std::string first = stampOf(before) + row.offset;
+            const std::string last = stampOf(localWallClock()) + row.offset;
             bool inside = strlen(stamp) == first.size() && first <= stamp && stamp <= last;
             return inside ? "" : std::string(stamp) + " is not " + first;
         });
@@ -75,28 +69,22 @@ TEST(Xtime, BaseConversionAndLogStamp_FollowTheZone) {
     }
 }
 
-// Regression (the last check): the helpers used localtime and gmtime, whose one
-// result record is shared by the whole process, so a conversion on another
-// thread (a log time stamp, the timer thread) could change a time under its reader.
+// Regression (the last check): the helpers used localtime and gmtime, whose
+// one result record is shared by the whole process and its threads.
 TEST(Xtime, Strf_FormatsWholeSecondsAsUtcLeavingTheSharedRecordAlone) {
     const time_t newYear1971 = 86400 * 365;
     const struct tm* shared = gmtime(&newYear1971);
-    const struct {
-        size_t size;
-        const char* format;
-        long long t;
-        const char* want;  // empty: does not fit, result 0
-    } rows[] = {
-        {20, "%Y-%m-%d %H:%M:%S", 0, "1970-01-01 00:00:00"},
-        {19, "%Y-%m-%d %H:%M:%S", 0, ""},             // no room for the terminator
+    const std::tuple<size_t, const char*, long long, const char*> rows[] = {
+        {20, "%F %T", 0, "1970-01-01 00:00:00"},
+        {19, "%F %T", 0, ""},                         // no room for the terminator
         {128, "%H:%M:%S", 3723999999LL, "01:02:03"},  // microseconds dropped, not rounded
         {128, "%S", -1, "00"},                        // -1 us has whole seconds 0
         {128, "%S", -1000001, "59"},                  // -1.000001 s has whole seconds -1
     };
-    for (const auto& row : rows) {
+    for (const auto& [size, format, t, want] : rows) {  // want empty: does not fit, result 0
         char buf[128] = "";
-        size_t length = xtimeStrf(buf, row.size, row.format, row.t);
-        EXPECT_EQ(std::string(buf, std::min(length, sizeof(buf))), row.want) << row.t;
+        size_t length = xtimeStrf(buf, size, format, t);
+        EXPECT_EQ(std::string(buf, std::min(length, sizeof(buf))), want) << t;
     }
     xtimeNow();
     xtimeToUtc(12345 * kSecond);

@@ -16,8 +16,8 @@ inline std::atomic<int> attempts{0};
 
 extern "C" int pthread_create(pthread_t* thread, const pthread_attr_t* attr, void* (*entry)(void*),
                               void* arg) {
-    using Create = int (*)(pthread_t*, const pthread_attr_t*, void* (*)(void*), void*);
-    static const Create real = reinterpret_cast<Create>(dlsym(RTLD_NEXT, "pthread_create"));
+    static const auto real =
+        reinterpret_cast<decltype(&pthread_create)>(dlsym(RTLD_NEXT, __func__));
     threadfault::attempts.fetch_add(1);
     int left = threadfault::allowed.load();
     while (left >= 0) {
@@ -27,8 +27,7 @@ extern "C" int pthread_create(pthread_t* thread, const pthread_attr_t* attr, voi
     return real(thread, attr, entry, arg);
 }
 
-class ThreadCreateFault {
-  public:
+struct ThreadCreateFault {
     explicit ThreadCreateFault(int succeedFirst) { threadfault::allowed.store(succeedFirst); }
     ~ThreadCreateFault() { threadfault::allowed.store(-1); }
     ThreadCreateFault(const ThreadCreateFault&) = delete;
