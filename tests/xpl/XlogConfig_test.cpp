@@ -54,12 +54,8 @@ TEST(XlogConfig, LibInitAndSetLevels_FixTheLevelsThenApplyTokensUntilAMalformedO
 TEST(XlogConfig, XplLibInit_StartsCodesThenLoggerAndStopsAtAFailure) {
     TempDir dir;
     dir.write("plain", "");
-    const struct {
-        bool callersLogger;
-        std::string logFile;
-        xerr_t want;  // a file error translated: the codes were filled first
-        const char* lines;
-    } rows[] = {
+    // Whether the caller's logger is given, the log file, the result, `lines`.
+    const std::tuple<bool, std::string, xerr_t, const char*> rows[] = {
         {false, "", XERR_SUCCESS, ""},
         {true, "", XERR_SUCCESS,
          "D Source/xpl/Xlog xerr_t xlogLibInit(const XlogLogger *, const string &, const string "
@@ -70,6 +66,7 @@ TEST(XlogConfig, XplLibInit_StartsCodesThenLoggerAndStopsAtAFailure) {
     };
     for (const auto& row : rows) {
         ChildOutcome outcome = runInChild([&]() -> std::string {
+            const auto& [callersLogger, logFile, want, expected] = row;
             LogRecorder recorder;
             const XlogLogger callers = *xlogGetLogger();
             std::memset(g_xerr_xlat_table, 0, sizeof(g_xerr_xlat_table));
@@ -79,10 +76,10 @@ TEST(XlogConfig, XplLibInit_StartsCodesThenLoggerAndStopsAtAFailure) {
             g_xlog->logger = XlogLogger{xlogShouldLog, xlogPrint};
             recorder.clear();
             AndroidLogCapture capture;
-            xerr_t err = xplLibInit(row.callersLogger ? &callers : nullptr, row.logFile);
-            if (err != row.want || xerrFromNative(EINVAL) != XERR_INVAL) return xerrStr(err);
-            if (g_xlog->fileName != row.logFile) return "log file " + g_xlog->fileName;
-            const bool filled = row.want == XERR_SUCCESS && !row.callersLogger;
+            xerr_t err = xplLibInit(callersLogger ? &callers : nullptr, logFile);
+            if (err != want || xerrFromNative(EINVAL) != XERR_INVAL) return xerrStr(err);
+            if (g_xlog->fileName != logFile) return "log file " + g_xlog->fileName;
+            const bool filled = want == XERR_SUCCESS && !callersLogger;
             int levels = 0;  // 45 at I, XMEM at D
             for (const XlogModule& module : g_xlog->modules) levels += module.level;
             if (levels != 93 * filled) return "levels " + std::to_string(levels);
@@ -99,9 +96,10 @@ TEST(XlogConfig, XplLibInit_StartsCodesThenLoggerAndStopsAtAFailure) {
                                 line.text.end());
                 lines += std::to_string(line.priority) + " " + line.text + "\n";
             }
-            return lines == row.lines ? "" : "printed\n" + lines;
+            return lines == expected ? "" : "printed\n" + lines;
         });
-        EXPECT_TRUE(outcome.ok()) << row.logFile << row.callersLogger << ": " << outcome.describe();
+        EXPECT_TRUE(outcome.ok()) << std::get<1>(row) << std::get<0>(row) << ": "
+                                  << outcome.describe();
     }
 }
 

@@ -37,11 +37,9 @@ TEST(Xtime, BaseConversionAndLogStamp_FollowTheZone) {
     // Midwinter and midsummer 2026, 12:00:00.250 UTC, in true UTC microseconds.
     const long long winter = 1768392000LL * kSecond + 250000;
     const long long summer = 1782302400LL * kSecond + 250000;
-    const struct {
-        const char* tz;
-        long long standard, winter, summer;  // how far local time leads UTC
-        const char* offset;                  // the logger's: the standard one
-    } rows[] = {
+    // The zone, how far local time leads UTC (standard, in winter and summer), the
+    // logger's offset (the standard one).
+    const std::tuple<const char*, long long, long long, long long, const char*> rows[] = {
         {"UTC0", 0, 0, 0, "-0000"},
         {"IST-5:30", 19800 * kSecond, 19800 * kSecond, 19800 * kSecond, "+0530"},
         {"EST5", -5 * kHour, -5 * kHour, -5 * kHour, "-0500"},
@@ -49,23 +47,24 @@ TEST(Xtime, BaseConversionAndLogStamp_FollowTheZone) {
         {"XST-2XDT,M10.5.0/3,M3.5.0", 2 * kHour, 3 * kHour, 2 * kHour, "+0200"},
     };
     for (const auto& row : rows) {
-        ChildOutcome outcome = runWithTimeZone(row.tz, [&]() -> std::string {
+        ChildOutcome outcome = runWithTimeZone(std::get<0>(row), [&]() -> std::string {
+            const auto& [tz, standard, inWinter, inSummer, offset] = row;
             long long before = localWallClock(), now = xtimeNow();
             if (now < before || now > localWallClock()) return "xtimeNow is not the wall clock";
             // While daylight saving is in force the base is read as standard time.
-            for (const auto& [utc, lead] : {std::pair{winter, row.winter}, {summer, row.summer}}) {
-                if (xtimeToUtc(utc + lead) != utc + lead - row.standard) return "xtimeToUtc";
+            for (const auto& [utc, lead] : {std::pair{winter, inWinter}, {summer, inSummer}}) {
+                if (xtimeToUtc(utc + lead) != utc + lead - standard) return "xtimeToUtc";
             }
             if (xlogLibInit(nullptr, "", "") != XERR_SUCCESS) return "start-up failed";
             char stamp[64];
             before = localWallClock();
             xlogCurrentTime(stamp, sizeof(stamp));
-            const std::string first = stampOf(before) + row.offset;
-            const std::string last = stampOf(localWallClock()) + row.offset;
+            const std::string first = stampOf(before) + offset;
+            const std::string last = stampOf(localWallClock()) + offset;
             bool inside = strlen(stamp) == first.size() && first <= stamp && stamp <= last;
             return inside ? "" : std::string(stamp) + " is not " + first;
         });
-        EXPECT_TRUE(outcome.ok()) << row.tz << ": " << outcome.describe();
+        EXPECT_TRUE(outcome.ok()) << std::get<0>(row) << ": " << outcome.describe();
     }
 }
 
