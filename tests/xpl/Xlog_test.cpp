@@ -1,17 +1,17 @@
-// The logger core: the record as loaded, the default print's Android sink,
-// the fatal-error statement.
+// The logger core. A program of its own, which prints only in children: the
+// kernel-log stream (redirected by the kernel-log guard) is opened once per process.
 #include "xpl/Xlog.h"
 
-#include <android/log.h>
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <csignal>
-#include <cstdlib>
-#include <string>
+#include <thread>
 
 #include "support/AndroidLogCapture.h"
 #include "support/ChildProcess.h"
 #include "support/LogRecorder.h"
+#include "support/TempDir.h"
 
 namespace {
 
@@ -21,11 +21,9 @@ struct AtLoad {
     XlogLogger* logger = xlogGetLogger();
     bool onlyErrorsPass = true;
     AtLoad() {
-        for (int module = 0; module < XLOG_NUM_MODULES; ++module) {
-            onlyErrorsPass = onlyErrorsPass && logger->shouldLog(module, -1) &&
-                             logger->shouldLog(module, XLOG_LEVEL_E) &&
-                             !logger->shouldLog(module, XLOG_LEVEL_W);
-        }
+        for (int m = 0; m < XLOG_NUM_MODULES; ++m)
+            onlyErrorsPass &= logger->shouldLog(m, -1) && logger->shouldLog(m, XLOG_LEVEL_E) &&
+                              !logger->shouldLog(m, XLOG_LEVEL_W);
     }
 } g_atLoad;
 
@@ -39,17 +37,30 @@ TEST(Xlog, Record_BeforeTheLibrarysInitialisers_IsTheOneRecordAtLevelE) {
 
 // Regression (the texts): the argument list was handed to the kernel log and
 // then reused for the Android log, which formatted whatever followed.
-TEST(Xlog, Print_SendsTheMessageAsFormattedWithTheLevelsPriority) {
-    AndroidLogCapture capture;
-    const int priorities[] = {ANDROID_LOG_VERBOSE, ANDROID_LOG_ERROR, ANDROID_LOG_WARN,
-                              ANDROID_LOG_INFO,    ANDROID_LOG_DEBUG, ANDROID_LOG_VERBOSE,
-                              ANDROID_LOG_VERBOSE};  // for levels -1 to 5
-    for (int level = -1; level <= 5; ++level) {
-        xlogPrint(level, XLOG_MODULE_HCALL, "f", "g", 1, "%s:%d:%lld", "level", level, 1LL << 40);
-        ASSERT_EQ(capture.lines().size(), static_cast<size_t>(level + 2));
-        EXPECT_EQ(capture.lines().back().priority, priorities[level + 1]) << level;
-        EXPECT_EQ(capture.lines().back().text, "level:" + std::to_string(level) + ":1099511627776");
-    }
+TEST(Xlog, Print_SendsEachMessageAsFormattedToBothSinksFlushedAndOnOneStream) {
+    TempDir dir;
+    ChildOutcome outcome = runInChild([&]() -> std::string {
+        setenv("HOSTCALL_TEST_KMSG", (dir / "kmsg").c_str(), 1);
+        AndroidLogCapture capture;
+        std::string want, got;
+        for (int level = -1; level <= 5; ++level) {
+            xlogPrint(level, XLOG_MODULE_HCALL, "f", "g", 1, "%d:%lld;", level, 1LL << 40);
+            want += std::to_string(level) + ":1099511627776;";
+            if (dir.read("kmsg") != want) return "kernel log, flushed at once: " + dir.read("kmsg");
+        }
+        for (const AndroidLogLine& line : capture.lines()) got += line.text;
+        for (const AndroidLogLine& line : capture.lines()) got += std::to_string(line.priority);
+        if (got != want + "2654322") return "Android log: " + got;  // V E W I D V V
+        std::vector<std::thread> threads;
+        for (int i = 0; i < 8; ++i)
+            threads.emplace_back([i] { xlogPrint(1, XLOG_MODULE_XTHR, "f", "g", 1, "|%d", i); });
+        for (std::thread& thread : threads) thread.join();
+        // A second opening in "w+" mode would have cut what came before.
+        const std::string written = dir.read("kmsg");
+        const bool all = std::count(written.begin(), written.end(), '|') == 8;
+        return all && written.rfind(want, 0) == 0 && capture.lines().size() == 15 ? "" : written;
+    });
+    EXPECT_TRUE(outcome.ok()) << outcome.describe();
 }
 
 TEST(Xlog, Fatal_PrintsTheFatalLineThenBreaks) {

@@ -1,8 +1,6 @@
-// Stands in for a process that has run out of threads: this program's
-// pthread_create is replaced by one that, while a ThreadCreateFault is in
-// scope, lets a given number of creations through and then fails the rest
-// with EAGAIN, as the system does at its thread limit. It also counts every
-// creation. Include it in exactly one file of a test program.
+// Replaces pthread_create: while a ThreadCreateFault is in scope, the first
+// `succeedFirst` creations go through and the rest fail with EAGAIN, as at the
+// system's thread limit. Include it in exactly one file of a test program.
 #pragma once
 
 #include <dlfcn.h>
@@ -12,15 +10,14 @@
 #include <cerrno>
 
 namespace threadfault {
-// Creations still allowed before failures begin; below 0, no fault.
-inline std::atomic<int> allowed{-1};
+inline std::atomic<int> allowed{-1};  // below 0: no fault
 inline std::atomic<int> attempts{0};
 }  // namespace threadfault
 
 extern "C" int pthread_create(pthread_t* thread, const pthread_attr_t* attr, void* (*entry)(void*),
                               void* arg) {
-    using Create = int (*)(pthread_t*, const pthread_attr_t*, void* (*)(void*), void*);
-    static const Create real = reinterpret_cast<Create>(dlsym(RTLD_NEXT, "pthread_create"));
+    static const auto real =
+        reinterpret_cast<decltype(&pthread_create)>(dlsym(RTLD_NEXT, __func__));
     threadfault::attempts.fetch_add(1);
     int left = threadfault::allowed.load();
     while (left >= 0) {
@@ -30,8 +27,7 @@ extern "C" int pthread_create(pthread_t* thread, const pthread_attr_t* attr, voi
     return real(thread, attr, entry, arg);
 }
 
-class ThreadCreateFault {
-  public:
+struct ThreadCreateFault {
     explicit ThreadCreateFault(int succeedFirst) { threadfault::allowed.store(succeedFirst); }
     ~ThreadCreateFault() { threadfault::allowed.store(-1); }
     ThreadCreateFault(const ThreadCreateFault&) = delete;
