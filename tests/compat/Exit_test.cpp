@@ -72,7 +72,6 @@ static void waitUntilParked(const std::atomic<pid_t>& tid) {
 }
 
 static void connect() {
-    vmsgDeviceReset();
     VmsgDeviceScript script;
     script.results[7] = 7007;
     vmsgDeviceConfigure(script);

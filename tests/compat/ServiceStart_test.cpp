@@ -5,6 +5,7 @@
 
 #include <string>
 #include <thread>
+#include <tuple>
 #include <vector>
 
 #include "hcall/DeviceSession.h"
@@ -25,11 +26,7 @@ static std::string startAgain(VmsgDeviceEventKind connection) {
 }
 
 TEST(ServiceStart, Start_RepeatsOnlyTheStepsThatFailed) {
-    const struct {
-        const char* name;
-        int rounds;  // a race may go either way in one round
-        std::string (*body)();
-    } rows[] = {
+    const std::tuple<const char*, int, std::string (*)()> rows[] = {
         {"after a failed connect", 1,
          []() -> std::string {
              VmsgDeviceScript script;
@@ -38,14 +35,11 @@ TEST(ServiceStart, Start_RepeatsOnlyTheStepsThatFailed) {
              bridge::startService();
              LogRecorder log;
              bridge::startService();
-             std::string got;
-             for (const LoggedLine& l : log.lines(XLOG_MODULE_HCALL))
-                 got += std::to_string(l.level) + " " + l.file + ":" + std::to_string(l.line) +
-                        " " + l.text + "\n";
-             if (got !=
-                 "0 server/native/com_zelvane_server_KivHostCallService:74 "
-                 "hcallLibInitGuest failed, error -1\n")
-                 return "connection failure logged as: " + got;
+             const auto lines = log.lines(XLOG_MODULE_HCALL);
+             if (lines.size() != 1 || lines[0].level != 0 || lines[0].line != 74 ||
+                 lines[0].file != "server/native/com_zelvane_server_KivHostCallService" ||
+                 lines[0].text != "hcallLibInitGuest failed, error -1")
+                 return "connection failure logged wrongly";
              vmsgDeviceConfigure(VmsgDeviceScript());
              return startAgain(VmsgDeviceEventKind::Connect);
          }},
@@ -60,7 +54,7 @@ TEST(ServiceStart, Start_RepeatsOnlyTheStepsThatFailed) {
              if (g_thr_pool.numActive != 0) return "a worker never created counts";
              return startAgain(VmsgDeviceEventKind::Open);
          }},
-        {"from eight threads at once", 20,
+        {"from eight threads at once", 20,  // a race may go either way in one round
          []() -> std::string {
              Gate go;
              std::vector<std::thread> callers;
@@ -74,10 +68,10 @@ TEST(ServiceStart, Start_RepeatsOnlyTheStepsThatFailed) {
              return startAgain(VmsgDeviceEventKind::Open);
          }},
     };
-    for (const auto& row : rows) {
-        for (int round = 0; round < row.rounds; ++round) {
-            ChildOutcome child = runInChild(row.body);
-            ASSERT_TRUE(child.ok()) << row.name << ", round " << round << ": " << child.message;
+    for (const auto& [name, rounds, body] : rows) {
+        for (int round = 0; round < rounds; ++round) {
+            ChildOutcome child = runInChild(body);
+            ASSERT_TRUE(child.ok()) << name << ", round " << round << ": " << child.message;
         }
     }
 }

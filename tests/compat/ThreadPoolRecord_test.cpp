@@ -1,7 +1,6 @@
-// The worker pool as an outside caller uses it: the record declared here from
-// its seven members, without the library's header, and every operation run on
-// value-initialised pools on the stack and on the heap (where a library that
-// read past the record meets AddressSanitizer).
+// The pool record as a caller declares it, without the library's header; every
+// operation on value-initialised pools on the stack and the heap (where reading
+// past the record meets AddressSanitizer).
 #include <gtest/gtest.h>
 #include <sys/wait.h>
 
@@ -43,11 +42,6 @@ static void onStackAndHeap(const std::function<void(ThreadPool&)>& body) {
     body(*std::make_unique<ThreadPool>());
 }
 
-static size_t queued(ThreadPool& pool) {
-    std::lock_guard<std::mutex> lock(pool.mutex);
-    return pool.tasks.size();
-}
-
 // First in, first out, one task at a time, a task's own task at the back;
 // finishing discards nothing and returns once the queue has run.
 TEST(ThreadPoolRecord, OneWorker_RunsTasksInOrderAndFiniDrainsTheQueue) {
@@ -79,7 +73,7 @@ TEST(ThreadPoolRecord, OneWorker_RunsTasksInOrderAndFiniDrainsTheQueue) {
             std::lock_guard<std::mutex> lock(pool.mutex);
             stopping = pool.stop != 0;
         }
-        EXPECT_EQ(queued(pool), 20u) << "finishing discards nothing";
+        EXPECT_EQ(pool.tasks.size(), 20u) << "finishing discards nothing";
         release.open();
         finisher.join();
         EXPECT_EQ(events.events(), expected);
@@ -104,10 +98,10 @@ TEST(ThreadPoolRecord, Init_WhenCountZeroOrNegative_KeepsTasksForThreadEntry) {
             EXPECT_EQ(pool.numActive, count);
             xthrPoolFini(&pool);
             EXPECT_EQ(pool.stop, 1);
-            EXPECT_EQ(queued(pool), 3u);
+            EXPECT_EQ(pool.tasks.size(), 3u);
             xthrPoolThreadEntry(&pool);
             EXPECT_EQ(events.events(), (std::vector<std::string>{"first", "second"}));
-            EXPECT_EQ(queued(pool), 0u);
+            EXPECT_EQ(pool.tasks.size(), 0u);
         });
     }
 }
