@@ -1,7 +1,6 @@
-// The library at process exit: a child sets up one state, calls exit() and
-// reports what its exit-time checks found. Linked twice, with the archives in
-// the CMake build's order and in Android.bp's: g_thr_pool must be built before
-// g_hcall, so g_hcall is torn down first, in either order.
+// The library at process exit, in a child that sets up a state and calls exit().
+// Linked with the archives in the CMake build's order and in Android.bp's: in
+// both, g_thr_pool is built before g_hcall, so g_hcall is torn down first.
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/mman.h>
@@ -11,6 +10,7 @@
 #include <fstream>
 #include <memory>
 #include <thread>
+#include <tuple>
 
 #include "VmsgDeviceModel.h"
 #include "hcall/guest/HcallEnc.h"
@@ -27,35 +27,30 @@ constexpr int kRunScale = 1;
 
 // What a child shares with its exit-time checks. Never freed.
 struct Probe {
-    bool armed = false;
-    std::atomic<bool> exitBegun{false};
+    std::atomic<bool> armed{false};  // set as the child calls exit()
     long delayUs = 0;
     int fd = -1;
     void* mapping = nullptr;
     Gate release, done;
-    int result = 0;
-    std::string dropped;              // the connection's state when the pool dropped its queue
-    std::function<void()> afterExit;  // runs once every exit-time destructor has run
+    std::function<void()> afterExit;
 };
 static Probe* gProbe = nullptr;
 
-// Destroyed after the library's records: a thread coming back late meets
-// destroyed objects rather than an ended process.
-struct LingerAfterTeardown {
-    ~LingerAfterTeardown() {
-        if (gProbe && gProbe->armed) std::this_thread::sleep_for(std::chrono::milliseconds(3));
+// Destroyed after the library's records: checks what they left, then lingers
+// so that a thread coming back late meets destroyed objects, not an ended process.
+struct AfterTeardown {
+    ~AfterTeardown() {
+        if (!gProbe || !gProbe->armed) return;
+        if (gProbe->afterExit) gProbe->afterExit();
+        std::this_thread::sleep_for(std::chrono::milliseconds(3));
     }
-} gLinger __attribute__((init_priority(101)));
-
-__attribute__((destructor)) void checkAfterExit() {
-    if (gProbe && gProbe->armed && gProbe->afterExit) gProbe->afterExit();
-}
+} gAfterTeardown __attribute__((init_priority(101)));
 
 static bool mapped(void* address) { return msync(address, 4096, MS_ASYNC) == 0; }
 static bool isOpen(int fd) { return fcntl(fd, F_GETFD) != -1; }
 
 static void returnAfterExitBegins() {
-    while (!gProbe->exitBegun) std::this_thread::sleep_for(std::chrono::microseconds(50));
+    while (!gProbe->armed) std::this_thread::sleep_for(std::chrono::microseconds(50));
     std::this_thread::sleep_for(std::chrono::microseconds(gProbe->delayUs));
 }
 
@@ -72,9 +67,6 @@ static void waitUntilParked(const std::atomic<pid_t>& tid) {
 }
 
 static void connect() {
-    VmsgDeviceScript script;
-    script.results[7] = 7007;
-    vmsgDeviceConfigure(script);
     if (hcallLibInitGuest() != XERR_SUCCESS) childReport("no connection\n");
     gProbe->fd = g_hcall.client.mFd;
     gProbe->mapping = g_hcall.client.mHostBoundBuf;
@@ -83,23 +75,18 @@ static void connect() {
 // Destroyed, unrun, when g_thr_pool drops its queue at exit.
 struct DropWitness {
     ~DropWitness() {
-        bool released = !isOpen(gProbe->fd) && !mapped(gProbe->mapping);
-        if (gProbe->armed) gProbe->dropped = released ? "released" : "open";
+        if (gProbe->armed && (isOpen(gProbe->fd) || mapped(gProbe->mapping)))
+            childReport("queue dropped before the connection was released\n");
     }
 };
 
-// Each state entered `runs` times, since what goes wrong depends on timing;
-// run i returns i * delayStepUs microseconds into the exit.
+// Each state entered `runs` times, since what goes wrong depends on timing:
+// run i returns late i * 100 microseconds into the exit.
 TEST(Exit, Exit_WhileTheLibrarysThreadsWork_EndsCleanly) {
-    const struct {
-        const char* state;
-        int runs;
-        long delayStepUs;
-        void (*setUp)();
-    } rows[] = {
+    const std::tuple<const char*, int, void (*)()> rows[] = {
         // Regression: g_hcall's destructor unmapped the buffers while the
         // worker waited for the host, which then read its reply from them.
-        {"exchange in flight", 1, 0,
+        {"exchange in flight", 1,
          [] {
              connect();
              Gate inFlight;
@@ -108,7 +95,7 @@ TEST(Exit, Exit_WhileTheLibrarysThreadsWork_EndsCleanly) {
                  gProbe->release.wait();
              });
              std::thread([] {
-                 gProbe->result = hcallOnOrientationChangedRpc(1);
+                 if (hcallOnOrientationChangedRpc(1) != XERR_SUCCESS) childReport("failed\n");
                  gProbe->done.open();
              }).detach();
              inFlight.wait();
@@ -117,12 +104,11 @@ TEST(Exit, Exit_WhileTheLibrarysThreadsWork_EndsCleanly) {
                      childReport("closed under an exchange");
                  gProbe->release.open();
                  gProbe->done.wait();
-                 if (gProbe->result != 7007) childReport("the exchange did not complete");
              };
          }},
         // Regression: where g_hcall was built first, the pool was torn down
         // before the (idle) connection.
-        {"tasks queued behind a busy worker", 1, 0,
+        {"tasks queued behind a busy worker", 1,
          [] {
              connect();
              static Gate started;
@@ -135,14 +121,10 @@ TEST(Exit, Exit_WhileTheLibrarysThreadsWork_EndsCleanly) {
              xthrPoolAddTask(&g_thr_pool, [witness] { childReport("queued task ran\n"); });
              witness.reset();
              started.wait();
-             gProbe->afterExit = [] {
-                 if (gProbe->dropped != "released")
-                     childReport("queue dropped, connection " + gProbe->dropped);
-             };
          }},
         // Regression: destroying the condition variable a worker waited on
         // hung the exit in glibc. A timer not yet due never runs.
-        {"pool worker and timer thread parked", 5, 0,
+        {"pool worker and timer thread parked", 5,
          [] {
              static std::atomic<pid_t> worker{0}, timer{0};
              xthrPoolInit(&g_thr_pool, 1);
@@ -153,48 +135,36 @@ TEST(Exit, Exit_WhileTheLibrarysThreadsWork_EndsCleanly) {
              waitUntilParked(timer);
          }},
         // Regression: a worker back from its task read the destroyed queue.
-        {"pool worker and timer callback returning", 20, 100,
+        // A task added meanwhile is dropped quietly, not a caller error.
+        {"pool worker, timer callback and an adder at work", 20,
          [] {
-             static Gate task, callback;
+             static std::atomic<long> started{0}, added{0};
              xthrPoolInit(&g_thr_pool, 1);
              xthrPoolAddTask(&g_thr_pool, [] {
-                 task.open();
+                 ++started;
                  returnAfterExitBegins();
              });
-             for (int i = 0; i < 3; ++i) xthrPoolAddTask(&g_thr_pool, [] {});
              xtimerStart(0, [] {
-                 callback.open();
+                 ++started;
                  returnAfterExitBegins();
                  xtimerStart(0, [] {});
              });
-             task.wait();
-             callback.wait();
-         }},
-        // Dropped quietly: not a caller error with its debug break.
-        {"another thread adding tasks", 20, 0,
-         [] {
-             static std::atomic<long> added{0};
-             xthrPoolInit(&g_thr_pool, 1);
              std::thread([] {
                  for (;; ++added) xthrPoolAddTask(&g_thr_pool, [] {});
              }).detach();
-             while (added < 1000) std::this_thread::yield();
+             while (started < 2 || added < 1000) std::this_thread::yield();
          }},
     };
-    for (const auto& row : rows) {
-        for (int i = 0; i < (row.runs + kRunScale - 1) / kRunScale; ++i) {
-            ChildOutcome child = runInChild(
-                [&]() -> std::string {
-                    gProbe = new Probe();
-                    gProbe->delayUs = i * row.delayStepUs * kRunScale;
-                    // Before the library's exit-time destructors, registered at load.
-                    atexit([] { gProbe->exitBegun = true; });
-                    row.setUp();
-                    gProbe->armed = true;
-                    std::exit(0);
-                },
-                std::chrono::seconds(20));
-            EXPECT_TRUE(child.ok()) << row.state << ", run " << i << ": " << child.describe();
+    for (const auto& [state, runs, setUp] : rows) {
+        for (int i = 0; i < (runs + kRunScale - 1) / kRunScale; ++i) {
+            ChildOutcome child = runInChild([&]() -> std::string {
+                gProbe = new Probe();
+                gProbe->delayUs = i * 100 * kRunScale;
+                setUp();
+                gProbe->armed = true;
+                std::exit(0);
+            });
+            EXPECT_TRUE(child.ok()) << state << ", run " << i << ": " << child.describe();
         }
     }
 }
