@@ -80,8 +80,7 @@ struct DropWitness {
     }
 };
 
-// Each state entered `runs` times, since what goes wrong depends on timing:
-// run i returns late i * 100 microseconds into the exit.
+// What goes wrong depends on timing: run i returns late i * 100 us into the exit.
 TEST(Exit, Exit_WhileTheLibrarysThreadsWork_EndsCleanly) {
     const std::tuple<const char*, int, void (*)()> rows[] = {
         // Regression: g_hcall's destructor unmapped the buffers while the

@@ -14,8 +14,7 @@
 #include "threading/ThreadCreateFault.h"
 #include "xpl/XthrPool.h"
 
-// A last start, with levels set before it: one connection, those levels (the
-// support library's start must not run again), one worker.
+// A last start keeps levels set before it, and leaves one connection and one worker.
 static std::string startAgain() {
     xlogSetLevels("HCALL:V");
     bridge::startService();

@@ -41,8 +41,7 @@ static void onStackAndHeap(const std::function<void(ThreadPool&)>& body) {
     body(*std::make_unique<ThreadPool>());
 }
 
-// First in, first out, one task at a time, a task's own task at the back;
-// finishing discards nothing and returns once the queue has run.
+// A task's own task goes to the back; finishing runs the queue, discarding nothing.
 TEST(ThreadPoolRecord, OneWorker_RunsTasksInOrderAndFiniDrainsTheQueue) {
     onStackAndHeap([](ThreadPool& pool) {
         EventLog events;
@@ -75,8 +74,7 @@ TEST(ThreadPoolRecord, OneWorker_RunsTasksInOrderAndFiniDrainsTheQueue) {
     });
 }
 
-// No worker: tasks stay queued through xthrPoolFini, and the worker loop on
-// the caller's thread then runs them in order, skipping an empty one.
+// Tasks stay queued through xthrPoolFini for the worker loop on the caller's thread.
 TEST(ThreadPoolRecord, Init_WhenCountZeroOrNegative_KeepsTasksForThreadEntry) {
     for (int count : {0, -1}) {
         SCOPED_TRACE(count);
@@ -105,8 +103,7 @@ TEST(ThreadPoolRecord, Init_WhenSeveralWorkers_RunsTasksSideBySide) {
         ASSERT_EQ(xthrPoolInit(&pool, 2), XERR_SUCCESS);
         xthrPoolAddTask(&pool, [&] { warm.open(); });
         ASSERT_TRUE(warm.wait());
-        // Both workers wait now: each task must wake one, and only the
-        // second can open the gate the first waits on.
+        // Each task must wake a waiting worker: only a second opens the first's gate.
         xthrPoolAddTask(&pool, [&] { sawSecond = second.wait(); });
         xthrPoolAddTask(&pool, [&] { second.open(); });
         EXPECT_TRUE(second.wait()) << "the tasks waited for xthrPoolFini";
@@ -115,8 +112,7 @@ TEST(ThreadPoolRecord, Init_WhenSeveralWorkers_RunsTasksSideBySide) {
     });
 }
 
-// For the death test: what the fatal path printed, whether the pool's lock
-// was free then, and whether the line in the text is the statement's own.
+// What the fatal path printed, whether the lock was free, whether the line is its own.
 static ThreadPool* gFatalPool = nullptr;
 static void printToStderr(int level, int module, const char* file, const char*, int line,
                           const char* format, ...) {
