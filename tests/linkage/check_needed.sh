@@ -1,19 +1,11 @@
 #!/usr/bin/env bash
-# Checks the libraries the shipped library needs at load (its NEEDED
-# entries): exactly those named, in any order; a sanitizer build may add its
-# runtimes and the C library parts they pull in. Usage: check_needed.sh
-# LIBRARY NEEDED...
+# Usage: check_needed.sh LIBRARY NEEDED... The library needs exactly those, in any
+# order; a sanitizer build may add its runtimes and the C library parts they use.
 set -euo pipefail
-lib=$1
-shift
-needed=$(readelf -d "$lib" | sed -n 's/.*(NEEDED).*\[\(.*\)\]$/\1/p')
+needed=$(readelf -d "$1" | sed -n 's/.*(NEEDED).*\[\(.*\)\]$/\1/p')
 extra='^$'
 grep -Eq '^lib(a|ub|t)san\.so' <<<"$needed" && extra='^lib((a|ub|t)san|m|dl|pthread|rt)\.so'
-actual=$(grep -Ev "$extra" <<<"$needed" | sort)
-expected=$(printf '%s\n' "$@" | sort)
-if [[ "$actual" != "$expected" ]]; then
-    echo "NEEDED entries differ from the list (< listed, > $lib):"
-    diff <(echo "$expected") <(echo "$actual") || true
-    exit 1
-fi
-echo "NEEDED: $(echo "$actual" | wc -l) libraries, as listed"
+shift
+diff <(printf '%s\n' "$@" | sort) <(grep -Ev "$extra" <<<"$needed" | sort) ||
+    { echo "NEEDED entries differ (< listed, > library)"; exit 1; }
+echo "NEEDED: $# libraries, as listed"
