@@ -49,7 +49,7 @@ class ProcessTest {
     @ValueSource(strings = {"-1", " 7", "3x"})
     void NativeInit_WhenRepeatedWithEachDebugValue_StartsOnceAndSwitchesOnForNonZeroNumbers(String onValue,
             @TempDir Path dir) throws Exception {
-        run(0, CLASS_PATH, Map.of("HOSTCALL_PROPERTIES_FILE", dir.resolve("p.prop").toString()), "debug", onValue);
+        run(0, CLASS_PATH, Map.of("HOSTCALL_PROPERTIES_FILE", dir.resolve("p.prop").toString()), "debugSwitch", onValue);
     }
 
     @Test
@@ -61,43 +61,22 @@ class ProcessTest {
     @ParameterizedTest
     @ValueSource(strings = {"exit", "end"})
     void Exit_WhileTheWorkerIsInsideAHostCall_EndsCleanly(String how) throws Exception {
-        String output = run(how.equals("exit") ? 5 : 0, CLASS_PATH, Map.of(), "exit-busy", how);
+        String output = run(how.equals("exit") ? 5 : 0, CLASS_PATH, Map.of(), "exitBusy", how);
         assertTrue(output.contains("workerLeftHost=true"), "the held call came back during the exit:\n" + output);
-    }
-
-    /** HOSTCALL_SOAK_EXITS runs, two at a time, against a slow host that fails now and then; debug lines off. */
-    @Test
-    void Exit_AtRandomPointsOfASoak_EndsCleanlyEveryTime() {
-        long base = System.nanoTime() % 100_000;
-        IntStream.range(0, SoakTest.size("HOSTCALL_SOAK_EXITS", 12)).parallel().forEach(i -> {
-            String how = List.of("exit", "end", "throw").get(i % 3), seed = Long.toString(base + i);
-            Map<String, String> env = Map.of("VMSG_DEVICE_DELAY_JITTER_US", "40", "VMSG_DEVICE_FAIL_PER_MILLE", "20",
-                    "VMSG_DEVICE_RECORD", "0", "VMSG_DEVICE_SEED", seed, "HOSTCALL_PROPERTIES_FILE", "");
-            try {
-                String output = run(Map.of("exit", 3, "end", 0, "throw", 1).get(how), CLASS_PATH, env, "soak", how, seed);
-                int at = output.indexOf("ending: ");
-                assertTrue(at >= 0, seed + " reached its end:\n" + output);
-                System.out.println(seed + " " + output.substring(at, output.indexOf('\n', at)));
-            } catch (Exception e) {
-                throw new AssertionError(e);
-            }
-        });
     }
 
     @Test
     void JniOnLoad_WhenTheServiceClassIsMissing_LogsTheFailureAndRefusesTheLoad() throws Exception {
         run(0, String.join(File.pathSeparator, Stream.of(CLASS_PATH.split(File.pathSeparator))
-                .filter(entry -> !entry.endsWith("kivhostcall-service.jar")).toList()), Map.of(), "no-service");
+                .filter(entry -> !entry.endsWith("kivhostcall-service.jar")).toList()), Map.of(), "noService");
     }
 
     public static void main(String[] args) throws Exception {
         switch (args[0]) {
-            case "debug" -> debugSwitch(args[1]);
+            case "debugSwitch" -> debugSwitch(args[1]);
             case "start" -> start();
-            case "exit-busy" -> exitBusy(args[1].equals("exit"));
-            case "no-service" -> noService();
-            case "soak" -> soakExit(args[1], Long.parseLong(args[2]));
-            default -> throw new IllegalArgumentException(args[0]);
+            case "exitBusy" -> exitBusy(args[1]);
+            default -> noService();
         }
     }
 
@@ -157,13 +136,18 @@ class ProcessTest {
     }
 
     /** Ends the process while the worker is inside a host call that the host answers only after static destructors. */
-    static void exitBusy(boolean viaSystemExit) {
+    static void exitBusy(String how) {
         KivHostCallService s = started();
         holdUntilExit(12);
         s.native_onLocaleChanged("held");
         assertTrue(awaitHeld(WAIT.toMillis()), "the worker reached the host");
-        s.native_setClipboardText("queued behind the held call");
-        if (viaSystemExit) System.exit(5);
+        for (int id : new int[] {0, 1, SoakTest.PRODUCERS}) {  // callers that go on through the exit
+            SoakTest.Sender sender = new SoakTest.Sender(id, id);
+            Thread thread = new Thread(() -> { for (;;) sender.call(s); });
+            thread.setDaemon(true);
+            thread.start();
+        }
+        if (how.equals("exit")) System.exit(5);
     }
 
     static void noService() {
@@ -171,28 +155,5 @@ class ProcessTest {
         keepLoaded(System.getProperty("hostcall.lib"));
         assertThrows(UnsatisfiedLinkError.class, () -> System.load(System.getProperty("hostcall.lib")), "JNI_OnLoad -1");
         assertEquals(List.of(ON_LOAD, error("ERROR: KivHostCallService native registration failed")), bridgeLines(0));
-    }
-
-    /** Senders that never stop, a native_init at a random moment or none, and an end at a random moment. */
-    static void soakExit(String how, long seed) throws Exception {
-        SplittableRandom random = new SplittableRandom(seed);
-        KivHostCallService s = load();
-        long initAtMs = random.nextLong(100), endAtMs = random.nextLong(400);
-        for (int id : new int[] {0, 1, 2, SoakTest.PRODUCERS, SoakTest.PRODUCERS + 1}) {
-            SoakTest.Sender sender = new SoakTest.Sender(seed, id);
-            Thread thread = new Thread(() -> { for (;;) sender.send(s); });
-            thread.setDaemon(true);
-            thread.start();
-        }
-        long started = System.nanoTime();
-        if (initAtMs < endAtMs) {
-            Thread.sleep(initAtMs);
-            s.native_init();
-        }
-        Thread.sleep(Math.max(0, endAtMs - (System.nanoTime() - started) / 1_000_000));
-        System.out.println("ending: " + how + " initAtMs=" + (initAtMs < endAtMs ? initAtMs : "never") + " endAtMs=" + endAtMs);
-        System.out.flush();
-        if (how.equals("exit")) System.exit(3);
-        if (how.equals("throw")) throw new IllegalStateException("the soak ends with an uncaught exception");
     }
 }

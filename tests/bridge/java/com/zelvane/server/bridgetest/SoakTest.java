@@ -10,17 +10,15 @@ import java.lang.management.ManagementFactory;
 import java.nio.charset.StandardCharsets;
 import java.nio.file.*;
 import java.util.*;
-import java.util.concurrent.CyclicBarrier;
 import java.util.regex.*;
 import org.junit.jupiter.api.Test;
 
 /**
- * Producers send every kind of event with a value to tag, askers ask the two queries, against a slow host that fails
- * now and then, debug lines off. In rounds (all send a batch, the host catches up), so that memory compares between
- * rounds. HOSTCALL_SOAK_EVENTS sizes it, HOSTCALL_SOAK_SEED repeats a run.
+ * Producers send every kind of event with a value to tag and askers ask the two queries, against a slow host that
+ * fails now and then, debug lines off. HOSTCALL_SOAK_EVENTS sizes it, HOSTCALL_SOAK_SEED repeats a run.
  */
 class SoakTest {
-    static final int PRODUCERS = 4, ASKERS = 2, ROUNDS = 20;
+    static final int PRODUCERS = 4, ASKERS = 2;
     // The native heap in use moves by up to 700 KB: 2 MB finds a leak of 150 bytes an event in the short run.
     static final long HEAP_MARGIN = 2L << 20;
     // A call's tag: "S<sender>#<seq>" in its strings, INT_TAG_BASE + sender * MAX_SEQ + seq in its ints.
@@ -32,7 +30,7 @@ class SoakTest {
         return value == null || value.isEmpty() ? fallback : Integer.parseInt(value);
     }
 
-    /** A sender's calls, events for a producer and queries for an asker, follow from the seed: the check replays them. */
+    /** A sender's calls (events for a producer, queries for an asker) follow from the seed: the check replays them. */
     static final class Sender {
         final int id;
         final SplittableRandom random;
@@ -61,7 +59,7 @@ class SoakTest {
             seq = (seq + 1) % MAX_SEQ;
         }
 
-        Object send(KivHostCallService s) {
+        Object call(KivHostCallService s) {
             next();
             return row.call(s, args);
         }
@@ -72,13 +70,13 @@ class SoakTest {
     }
 
     final long seed = size("HOSTCALL_SOAK_SEED", (int) (System.nanoTime() % 1000));
-    final int perRound = Math.max(1, size("HOSTCALL_SOAK_EVENTS", 20_000) / (PRODUCERS * ROUNDS));
+    final int events = size("HOSTCALL_SOAK_EVENTS", 20_000);
     final List<String> problems = new ArrayList<>();
     long delivered, failed;
 
-    /** Askers ask once for every eight events a producer sends. */
-    int perRound(int id) {
-        return id < PRODUCERS ? perRound : Math.max(1, perRound / 8);
+    /** A sender's calls: askers ask once for every eight events a producer sends. */
+    int calls(int id) {
+        return events / PRODUCERS / (id < PRODUCERS ? 1 : 8);
     }
 
     @Test
@@ -88,10 +86,11 @@ class SoakTest {
             Files.write(trace, new byte[0]);  // the host appends
             KivHostCallService s = load();
             s.native_init();
-            long[] heap = run(s);
+            // After a quarter of the calls, when the heap has warmed up, and at the end.
+            long[] heap = {send(s, 0, 1), send(s, 1, 4)};
             verify(trace);
-            String summary = "seed " + seed + ", " + perRound * PRODUCERS * ROUNDS + " events: " + delivered
-                    + " delivered, " + failed + " failed; native heap after warm-up " + Arrays.toString(heap);
+            String summary = "seed " + seed + ", " + events + " events: " + delivered + " delivered, " + failed
+                    + " failed; native heap after warm-up and at the end " + Arrays.toString(heap);
             System.out.println(summary);
             assertEquals(List.of(), problems, "every call once, in its sender's order, as sent: " + summary);
             assertEquals(0, overlaps(), "host calls never overlap");
@@ -102,48 +101,28 @@ class SoakTest {
         }
     }
 
-    /** Returns the native heap in use after warm-up and at the end, when the host has served everything. */
-    long[] run(KivHostCallService s) throws Exception {
-        CyclicBarrier barrier = new CyclicBarrier(PRODUCERS + ASKERS + 1);
+    /** Sends the calls from `from` to `to` quarters from all senders; returns the native heap once all are served. */
+    long send(KivHostCallService s, int from, int to) throws Exception {
         List<Thread> threads = new ArrayList<>();
-        for (int t = 0; t < PRODUCERS + ASKERS; t++) {
-            Sender sender = new Sender(seed, t);
+        long served = 0;
+        for (int id = 0; id < PRODUCERS + ASKERS; id++) {
+            Sender sender = new Sender(seed, id);
+            int first = calls(id) * from / 4, end = calls(id) * to / 4;
+            served += end;
+            for (int i = 0; i < first; i++) sender.next();
             threads.add(new Thread(() -> {
-                try {
-                    for (int r = 0; r < ROUNDS; r++) {
-                        barrier.await();
-                        for (int i = 0; i < perRound(sender.id); i++)
-                            if (!sender.send(s).equals(0) && sender.id < PRODUCERS) problem("an event refused");
-                        barrier.await();
-                    }
-                } catch (Exception e) {
-                    problem(e.toString());
-                }
+                for (int i = first; i < end; i++)
+                    if (!sender.call(s).equals(0) && sender.id < PRODUCERS) problem("an event refused");
             }));
         }
         threads.forEach(Thread::start);
-        long[] heap = new long[2];
-        for (int r = 0, served = 0; r < ROUNDS; r++) {
-            barrier.await();
-            barrier.await();
-            for (int id = 0; id < PRODUCERS + ASKERS; id++) served += perRound(id);
-            if (!awaitServed(served, WAIT.toMillis()))
-                throw new AssertionError(served() + " exchanges after round " + r + ": events were lost");
-            takeLogLines();  // so that the capture does not grow with the run
-            if (r == ROUNDS / 4) {
-                // HotSpot frees its compilers' arena chunks every 5 s of uptime; from then on the JIT moves little.
-                Thread.sleep(Math.max(0, 5500 - ManagementFactory.getRuntimeMXBean().getUptime()));
-                heap[0] = heapInUse();
-            }
-        }
         for (Thread t : threads) t.join();
-        heap[1] = heapInUse();
-        return heap;
-    }
-
-    /** The least of a few samples: the JVM borrows memory for moments. */
-    static long heapInUse() throws Exception {
-        long least = Long.MAX_VALUE;
+        if (!awaitServed(served, WAIT.toMillis() + served / 10))
+            throw new AssertionError(served() + " of " + served + " exchanges: events were lost");
+        takeLogLines();  // so that the capture does not grow with the run
+        // HotSpot frees its compilers' arena chunks every 5 s of uptime; from then on the JIT moves little.
+        Thread.sleep(Math.max(0, 5500 - ManagementFactory.getRuntimeMXBean().getUptime()));
+        long least = Long.MAX_VALUE;  // of a few samples: the JVM borrows memory for moments
         for (int i = 0; i < 5; i++, Thread.sleep(100)) least = Math.min(least, nativeHeapInUse());
         return least;
     }
@@ -165,8 +144,7 @@ class SoakTest {
                     problem("S" + sender.id + "#" + (sender.seq - 1) + " expected, the host got " + part[2]);
             }
         }
-        for (Sender sender : replay)
-            if (sender.seq != ROUNDS * perRound(sender.id)) problem(sender.id + ": the host got " + sender.seq + " of " + ROUNDS * perRound(sender.id));
+        for (Sender s : replay) if (s.seq != calls(s.id)) problem(s.id + " got " + s.seq + " of " + calls(s.id));
     }
 
     synchronized void problem(String what) {
