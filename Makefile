@@ -41,7 +41,7 @@ bench: build
 	cmake --build build -j $(JOBS) --target hostcall_bench
 	bench/run-bench.sh build
 
-# The service bridge's soak and exit proof at full size (make test runs them short).
+# The service bridge's soak at full size (make test runs it short).
 soak: build
 	HOSTCALL_SOAK_EVENTS=400000 ctest --test-dir build --output-on-failure -L soak
 
