@@ -1,7 +1,5 @@
-// Captures what reaches the Android log (priority, tag, text) through liblog's
-// own logger hook, for tests that check lines written with __android_log_*.
-// One capture at a time; the destructor hands liblog back to its standard
-// error logger.
+// Captures what reaches the Android log through liblog's own logger hook. One
+// capture at a time; the destructor hands liblog back to its stderr logger.
 #pragma once
 
 #include <android/log.h>
@@ -20,11 +18,7 @@ struct AndroidLogLine {
 class AndroidLogCapture {
   public:
     AndroidLogCapture() {
-        Sink& s = sink();
-        {  // acquire lock
-            std::lock_guard<std::mutex> lock(s.mutex);
-            s.lines.clear();
-        }  // release lock
+        take();
         __android_log_set_logger(&AndroidLogCapture::record);
         previousMinimum_ = __android_log_set_minimum_priority(ANDROID_LOG_VERBOSE);
     }
@@ -47,15 +41,6 @@ class AndroidLogCapture {
         Sink& s = sink();
         std::lock_guard<std::mutex> lock(s.mutex);
         return std::exchange(s.lines, {});
-    }
-
-    // Lines whose text contains `needle`.
-    std::vector<AndroidLogLine> linesContaining(const std::string& needle) const {
-        std::vector<AndroidLogLine> found;
-        for (const AndroidLogLine& line : lines()) {
-            if (line.text.find(needle) != std::string::npos) found.push_back(line);
-        }
-        return found;
     }
 
   private:

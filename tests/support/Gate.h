@@ -1,8 +1,6 @@
-// Gates and event logs for tests that check the order of work on other
-// threads without sleeping. A gate opens once and stays open; destroying it
-// opens it, so a failed assertion cannot leave a thread blocked on it. Every
-// wait is bounded by a tolerance far beyond any honest delay, so a fault shows
-// as a failure rather than a hung suite.
+// Gates and event logs order work on other threads without sleeping. A gate
+// opens on destruction too, so a failed assertion leaves no thread blocked; every
+// wait is bounded, so a fault shows as a failure rather than a hung suite.
 #pragma once
 
 #include <chrono>
@@ -27,15 +25,10 @@ class Gate {
         cond_.notify_all();
     }
 
-    // True once the gate is open; false when the tolerance ran out first.
+    // False when the tolerance ran out first.
     bool wait(std::chrono::milliseconds tolerance = kGateTolerance) {
         std::unique_lock<std::mutex> lock(mutex_);
         return cond_.wait_for(lock, tolerance, [this] { return open_; });
-    }
-
-    bool isOpen() {
-        std::lock_guard<std::mutex> lock(mutex_);
-        return open_;
     }
 
   private:
@@ -53,11 +46,10 @@ class EventLog {
         cond_.notify_all();
     }
 
-    // True once at least `count` events are in; false when the tolerance ran
-    // out first.
-    bool waitForCount(size_t count, std::chrono::milliseconds tolerance = kGateTolerance) {
+    // False when the tolerance ran out before `count` events were in.
+    bool waitForCount(size_t count) {
         std::unique_lock<std::mutex> lock(mutex_);
-        return cond_.wait_for(lock, tolerance, [&] { return events_.size() >= count; });
+        return cond_.wait_for(lock, kGateTolerance, [&] { return events_.size() >= count; });
     }
 
     std::vector<std::string> events() {

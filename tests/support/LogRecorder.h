@@ -1,13 +1,12 @@
-// Captures every line the library's logger is asked to print, through a
-// caller-supplied XlogLogger installed with xlogLibInit. Lines above the
-// recorder's level are refused at the should-log step, so they are never
-// formatted. One recorder at a time; the destructor reinstates the default
-// operations.
+// Captures the lines the library's logger prints, through a caller's XlogLogger.
+// Lines above the recorder's level are refused at the should-log step, so they
+// are never formatted. One recorder at a time.
 #pragma once
 
 #include <atomic>
 #include <cstdarg>
 #include <cstdio>
+#include <cstdlib>
 #include <mutex>
 #include <string>
 #include <vector>
@@ -39,7 +38,6 @@ class LogRecorder {
     LogRecorder(const LogRecorder&) = delete;
     LogRecorder& operator=(const LogRecorder&) = delete;
 
-    void setMaxLevel(int level) { state().maxLevel = level; }
     void clear() {
         std::lock_guard<std::mutex> lock(state().mutex);
         state().lines.clear();
@@ -51,12 +49,6 @@ class LogRecorder {
         std::vector<LoggedLine> found;
         for (const LoggedLine& line : state().lines)
             if (line.module == module) found.push_back(line);
-        return found;
-    }
-    // Texts of the lines printed under `module`, in order.
-    std::vector<std::string> texts(int module) const {
-        std::vector<std::string> found;
-        for (const LoggedLine& line : lines(module)) found.push_back(line.text);
         return found;
     }
     // (module, level) pairs the should-log step was asked about.
@@ -87,13 +79,10 @@ class LogRecorder {
                                                             const char* format, ...) {
         va_list args;
         va_start(args, format);
-        va_list measure;
-        va_copy(measure, args);
-        int size = std::vsnprintf(nullptr, 0, format, measure);
-        va_end(measure);
-        std::string text(size > 0 ? size_t(size) : 0, '\0');
-        std::vsnprintf(&text[0], text.size() + 1, format, args);
+        char* raw = nullptr;  // left alone when formatting fails
+        const std::string text = vasprintf(&raw, format, args) >= 0 ? raw : "";
         va_end(args);
+        free(raw);
         State& s = state();
         std::lock_guard<std::mutex> lock(s.mutex);
         s.lines.push_back(LoggedLine{level, module, file, function, line, format, text});

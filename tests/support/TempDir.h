@@ -1,5 +1,4 @@
-// A fresh folder under /tmp for one test, removed with all it holds when the
-// owner goes out of scope, and small helpers for the files in it.
+// A fresh folder under /tmp, removed with all it holds when it goes out of scope.
 #pragma once
 
 #include <ftw.h>
@@ -26,7 +25,6 @@ class TempDir {
     TempDir(const TempDir&) = delete;
     TempDir& operator=(const TempDir&) = delete;
 
-    const std::string& path() const { return path_; }
     std::string operator/(const std::string& name) const { return path_ + "/" + name; }
 
     // What the file `name` holds; empty when it cannot be read.

@@ -1,8 +1,6 @@
 // The pool and the timer service as seen from the C library's thread calls. A
 // program of its own: it replaces pthread_create and pthread_cond_signal/_broadcast.
-#include <dlfcn.h>
 #include <gtest/gtest.h>
-#include <pthread.h>
 
 #include <climits>
 
@@ -40,9 +38,10 @@ TEST(ThreadCreateFailure,
         ThreadCreateFault fault(/*succeedFirst=*/2);
         EXPECT_EQ(xthrPoolInit(&pool, 4), XERR_AGAIN);
     }
-    EXPECT_EQ(recorder.texts(XLOG_MODULE_XTHR),
-              std::vector<std::string>{"xthrPoolInit: started 2 of 4 workers, error 11\n"});
-    EXPECT_EQ(recorder.lines(XLOG_MODULE_XTHR).at(0).level, XLOG_LEVEL_E);
+    const std::vector<LoggedLine> lines = recorder.lines(XLOG_MODULE_XTHR);
+    ASSERT_EQ(lines.size(), 1u);
+    EXPECT_EQ("EWIDV"[lines[0].level] + lines[0].text,
+              "ExthrPoolInit: started 2 of 4 workers, error 11\n");
     EXPECT_EQ(pool.numThreads * 10 + pool.numActive, 42) << "4 asked for, 2 to wait for";
     // Both started workers are live: each holds a task until the other runs.
     std::atomic<int> runs{0};

@@ -49,12 +49,11 @@ TEST(XlogConfig, LibInitAndSetLevels_FixTheLevelsThenApplyTokensUntilAMalformedO
     }
 }
 
-// Each row in a child put back to the state at load. `lines`: the caller's
-// logger's, then the Android log's less digits; "*:V" then shows XLOG's D lines.
+// Each row (the caller's logger given?, log file, result, `lines`) runs in a child put back
+// to the state at load. `lines`: the caller's logger's, then the Android log's less digits.
 TEST(XlogConfig, XplLibInit_StartsCodesThenLoggerAndStopsAtAFailure) {
     TempDir dir;
     dir.write("plain", "");
-    // Whether the caller's logger is given, the log file, the result, `lines`.
     const std::tuple<bool, std::string, xerr_t, const char*> rows[] = {
         {false, "", XERR_SUCCESS, ""},
         {true, "", XERR_SUCCESS,

@@ -4,7 +4,6 @@
 #include "xpl/Xtimer.h"
 
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
 
 #include <climits>
 

@@ -30,8 +30,6 @@ extern "C" int pthread_create(pthread_t* thread, const pthread_attr_t* attr, voi
 struct ThreadCreateFault {
     explicit ThreadCreateFault(int succeedFirst) { threadfault::allowed.store(succeedFirst); }
     ~ThreadCreateFault() { threadfault::allowed.store(-1); }
-    ThreadCreateFault(const ThreadCreateFault&) = delete;
-    ThreadCreateFault& operator=(const ThreadCreateFault&) = delete;
 };
 
 inline int threadCreateAttempts() { return threadfault::attempts.load(); }
