@@ -25,8 +25,10 @@ long long localWallClock() {
 
 // A base value as the logger stamps it, less the zone's offset.
 std::string stampOf(long long t) {
+    const time_t seconds = static_cast<time_t>(t / kSecond);
+    struct tm broken {};
     char text[64];
-    const size_t length = xtimeStrf(text, sizeof(text), "%F %T", t);
+    size_t length = strftime(text, sizeof(text), "%F %T", gmtime_r(&seconds, &broken));
     snprintf(text + length, sizeof(text) - length, ".%03d", static_cast<int>(t % kSecond / 1000));
     return text;
 }
