@@ -1,6 +1,5 @@
-// The library at process exit, in a child that sets up a state and calls exit().
-// Linked with the archives in the CMake build's order and in Android.bp's: in
-// both, g_thr_pool is built before g_hcall, so g_hcall is torn down first.
+// The library at exit() in a child, linked with the archives in CMake's order and in Android.bp's:
+// in both, g_thr_pool is built before g_hcall, so g_hcall is torn down first.
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/mman.h>
@@ -54,7 +53,6 @@ static void returnAfterExitBegins() {
     std::this_thread::sleep_for(std::chrono::microseconds(gProbe->delayUs));
 }
 
-// Waits until thread `tid`, once known, blocks in a futex wait.
 static void waitUntilParked(const std::atomic<pid_t>& tid) {
     for (auto end = std::chrono::steady_clock::now() + kGateTolerance;
          std::chrono::steady_clock::now() < end;
@@ -71,14 +69,6 @@ static void connect() {
     gProbe->fd = g_hcall.client.mFd;
     gProbe->mapping = g_hcall.client.mHostBoundBuf;
 }
-
-// Destroyed, unrun, when g_thr_pool drops its queue at exit.
-struct DropWitness {
-    ~DropWitness() {
-        if (gProbe->armed && (isOpen(gProbe->fd) || mapped(gProbe->mapping)))
-            childReport("queue dropped before the connection was released\n");
-    }
-};
 
 // What goes wrong depends on timing: run i returns late i * 100 us into the exit.
 TEST(Exit, Exit_WhileTheLibrarysThreadsWork_EndsCleanly) {
@@ -116,7 +106,11 @@ TEST(Exit, Exit_WhileTheLibrarysThreadsWork_EndsCleanly) {
                  started.open();
                  for (;;) pause();
              });
-             auto witness = std::make_shared<DropWitness>();
+             // Destroyed, unrun, when g_thr_pool drops its queue at exit.
+             std::shared_ptr<void> witness(nullptr, [](void*) {
+                 if (gProbe->armed && (isOpen(gProbe->fd) || mapped(gProbe->mapping)))
+                     childReport("queue dropped before the connection was released\n");
+             });
              xthrPoolAddTask(&g_thr_pool, [witness] { childReport("queued task ran\n"); });
              witness.reset();
              started.wait();

@@ -3,6 +3,7 @@
 
 #include <gtest/gtest.h>
 
+#include <memory>
 #include <string>
 #include <thread>
 #include <vector>
@@ -14,7 +15,6 @@
 #include "threading/ThreadCreateFault.h"
 #include "xpl/XthrPool.h"
 
-// A last start keeps levels set before it, and leaves one connection and one worker.
 static std::string startAgain() {
     xlogSetLevels("HCALL:V");
     bridge::startService();
@@ -37,10 +37,9 @@ TEST(ServiceStart, Start_AfterAFailedConnectAndWorker_RepeatsOnlyWhatFailed) {
             lines[0].text != "hcallLibInitGuest failed, error -1")
             return "connection failure logged wrongly";
         vmsgDeviceConfigure(VmsgDeviceScript());
-        {
-            ThreadCreateFault fault(/*succeedFirst=*/0);
-            bridge::startService();
-        }
+        auto fault = std::make_unique<ThreadCreateFault>(/*succeedFirst=*/0);
+        bridge::startService();
+        fault.reset();
         // Regression: a worker that could not be created was taken for
         // started, and every later call said "already started".
         if (g_thr_pool.numActive != 0) return "a worker never created counts";

@@ -6,7 +6,5 @@ set -euo pipefail
 export LC_ALL=C # one collation for sort and diff
 exported=$(nm -D --defined-only "$1" | awk '{ print $NF }' | c++filt |
     sed 's/std::__cxx11::basic_string<char, std::char_traits<char>, std::allocator<char> >/std::string/g' | sort)
-listed=$(grep -v -e '^#' -e '^[[:space:]]*$' "$2" |
-    awk 'NF > 1 { sub(/^[^[:space:]]+[[:space:]]+/, "") } { print }' | sort)
+listed=$(awk '/^#/ || !NF { next } NF > 1 { sub(/^[^[:space:]]+[[:space:]]+/, "") } { print }' "$2" | sort)
 diff <(echo "$exported") <(echo "$listed") || { echo "Exports differ (< library, > list)"; exit 1; }
-echo "$(echo "$exported" | wc -l) symbols exported, exactly as listed"

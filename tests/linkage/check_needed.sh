@@ -8,4 +8,3 @@ grep -Eq '^lib(a|ub|t)san\.so' <<<"$needed" && extra='^lib((a|ub|t)san|m|dl|pthr
 shift
 diff <(printf '%s\n' "$@" | sort) <(grep -Ev "$extra" <<<"$needed" | sort) ||
     { echo "NEEDED entries differ (< listed, > library)"; exit 1; }
-echo "NEEDED: $# libraries, as listed"

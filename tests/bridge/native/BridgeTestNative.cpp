@@ -26,9 +26,8 @@ AndroidLogCapture* const gCapture = new AndroidLogCapture();
 struct ExitGate {
     std::mutex mutex;
     std::condition_variable changed;
-    bool open = false;
+    bool open = false, left = false;
     int held = 0;
-    bool left = false;
 };
 ExitGate* const gGate = new ExitGate();
 
@@ -43,9 +42,7 @@ struct OpenAtExit {
         usleep(300 * 1000);  // the released worker's grace
         std::lock_guard<std::mutex> lock(gGate->mutex);
         // Straight to the descriptor: stdio may already be shut down.
-        const std::string line =
-            std::string("RESULT workerLeftHost=") + (gGate->left ? "true\n" : "false\n");
-        (void)!write(STDOUT_FILENO, line.data(), line.size());
+        if (gGate->left) (void)!write(STDOUT_FILENO, "workerLeftHost=true\n", 20);
     }
 } gOpenAtExit;
 
@@ -92,7 +89,6 @@ TEST_NATIVE(jstring, exchanges)(JNIEnv* env, jclass) {
 
 TEST_NATIVE(jint, overlaps)(JNIEnv*, jclass) { return jint(vmsgDeviceOverlapCount()); }
 TEST_NATIVE(jint, openDevices)(JNIEnv*, jclass) { return jint(vmsgDeviceOpenCount()); }
-TEST_NATIVE(jlong, served)(JNIEnv*, jclass) { return jlong(vmsgDeviceServedCount()); }
 TEST_NATIVE(jboolean, awaitServed)(JNIEnv*, jclass, jlong count, jlong timeoutMs) {
     return vmsgDeviceWaitForServed(uint64_t(count), uint32_t(timeoutMs));
 }

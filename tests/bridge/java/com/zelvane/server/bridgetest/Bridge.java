@@ -26,7 +26,6 @@ final class Bridge {
     static native String exchanges();  // the requests as hex, each ended by a blank
     static native int overlaps();
     static native int openDevices();
-    static native long served();
     static native boolean awaitServed(long count, long timeoutMs);
     static native void keepLoaded(String path);  // whatever the JVM unloads
     static native void holdUntilExit(int opCode);  // the host answers after the library's static destructors
@@ -64,15 +63,11 @@ final class Bridge {
     }
 
     static List<String> bridgeLines(int from) {
-        List<String> all = lines(), lines = new ArrayList<>(all.subList(from, all.size()));
-        lines.removeIf(l -> !l.contains("|" + TAG + "|"));
-        return lines;
+        return new ArrayList<>(lines().stream().skip(from).filter(l -> l.contains("|" + TAG + "|")).toList());
     }
 
     static List<String> requests() {
-        List<String> hex = new ArrayList<>(Arrays.asList(exchanges().split(" ")));
-        hex.remove("");
-        return hex;
+        return new ArrayList<>(Arrays.stream(exchanges().split(" ")).filter(hex -> !hex.isEmpty()).toList());
     }
 
     /** Waits for the sentinel (and its returning line if debugOn); returns what the host got but it. */
@@ -86,9 +81,7 @@ final class Bridge {
             assertTrue(System.nanoTime() < deadline, "timed out waiting for the sentinel event");
             Thread.yield();
         }
-        List<String> received = requests();
-        received.removeAll(List.of(SENTINEL));
-        return received;
+        return requests().stream().filter(request -> !request.equals(SENTINEL)).toList();
     }
 
     static List<String> drainedLines(int from) {

@@ -32,9 +32,7 @@ class MethodsTest {
             return type + function + "(JNIEnv *, jobject" + (params.isEmpty() ? "" : ", " + params) + ")";
         }
 
-        boolean query() {
-            return op == 24 || op == 28;
-        }
+        boolean query() { return op == 24 || op == 28; }
 
         Object call(KivHostCallService s, Object... values) {
             try {
@@ -100,30 +98,24 @@ class MethodsTest {
             row("onVibrate", "jint, jstring", 30, " called", ": duration = 100, pkg = vib", 100, "vib"),
             row("onConsoleModeStateChanged", "jboolean", 43, null, ": called consoleModeState : 0", false));
 
-    private KivHostCallService s;
-
-    @BeforeEach
-    void drainAndReset() {
-        s = started();
-        drain(s, true);
-        configureHost(false, HOST_RESULTS);
-    }
+    private final KivHostCallService s = started();  // every test leaves no event behind
 
     @Test
     void EveryMethod_WhenCalled_ReturnsSendsItsArgumentsInOrderAndLogsItsLines() {
         for (Row row : ROWS) {
+            configureHost(false, HOST_RESULTS);
             int mark = lines().size();
             int result = row.op() == 28 ? -5 : row.op() == 14 ? -13 : 0;
             assertEquals(row.op() == 24 ? false : row.query() ? result : 0, row.call(s, row.args()), row.function());
             assertEquals(List.of(request(row.op(), row.args())), drain(s, true), row.function() + " sends");
             assertEquals(row.lines(result), drainedLines(mark), row.function() + " logs");
-            configureHost(false, HOST_RESULTS);
         }
     }
 
     /** A checked string refuses the call when empty or null; an unchecked one travels empty. */
     @Test
     void Strings_WhenEmptyOrNull_RefuseTheCallWhereCheckedAndTravelEmptyElsewhere() {
+        configureHost(false, HOST_RESULTS);
         List<String> expected = new ArrayList<>();
         for (Row row : ROWS) {
             for (int i = 0, strings = 0; i < row.args().length; i++) {

@@ -25,11 +25,6 @@ class SoakTest {
     static final int MAX_SEQ = 10_000_000, INT_TAG_BASE = 1_000_000_000;
     static final Pattern TAG = Pattern.compile("S(\\d+)#|\\b(1\\d{9})\\b");
 
-    static int size(String variable, int fallback) {
-        String value = System.getenv(variable);
-        return value == null || value.isEmpty() ? fallback : Integer.parseInt(value);
-    }
-
     /** A sender's calls (events for a producer, queries for an asker) follow from the seed: the check replays them. */
     static final class Sender {
         final int id;
@@ -63,14 +58,10 @@ class SoakTest {
             next();
             return row.call(s, args);
         }
-
-        String request() {
-            return Bridge.request(row.op(), args);
-        }
     }
 
-    final long seed = size("HOSTCALL_SOAK_SEED", (int) (System.nanoTime() % 1000));
-    final int events = size("HOSTCALL_SOAK_EVENTS", 20_000);
+    final long seed = Long.parseLong(System.getenv().getOrDefault("HOSTCALL_SOAK_SEED", "" + System.nanoTime() % 1000));
+    final int events = Integer.parseInt(System.getenv().getOrDefault("HOSTCALL_SOAK_EVENTS", "20000"));
     final List<String> problems = new ArrayList<>();
     long delivered, failed;
 
@@ -82,23 +73,19 @@ class SoakTest {
     @Test
     void Soak_WhenEveryKindIsSentWithQueriesAgainstAnUnreliableHost_DeliversEveryEventOnceInOrder() throws Exception {
         Path trace = Path.of(System.getenv("VMSG_DEVICE_TRACE"));
-        try {
-            Files.write(trace, new byte[0]);  // the host appends
-            KivHostCallService s = load();
-            s.native_init();
-            // After a quarter of the calls, when the heap has warmed up, and at the end.
-            long[] heap = {send(s, 0, 1), send(s, 1, 4)};
-            verify(trace);
-            String summary = "seed " + seed + ", " + events + " events: " + delivered + " delivered, " + failed
-                    + " failed; native heap after warm-up and at the end " + Arrays.toString(heap);
-            System.out.println(summary);
-            assertEquals(List.of(), problems, "every call once, in its sender's order, as sent: " + summary);
-            assertEquals(0, overlaps(), "host calls never overlap");
-            assertTrue(failed > 0 && delivered > failed, "the host failed some, not most: " + summary);
-            assertTrue(heap[1] - heap[0] < HEAP_MARGIN, "the native heap is flat: " + summary);
-        } finally {
-            Files.deleteIfExists(trace);
-        }
+        Files.write(trace, new byte[0]);  // the host appends
+        trace.toFile().deleteOnExit();
+        KivHostCallService s = started();
+        // After a quarter of the calls, when the heap has warmed up, and at the end.
+        long[] heap = {send(s, 0, 1), send(s, 1, 4)};
+        verify(trace);
+        String summary = "seed " + seed + ", " + events + " events: " + delivered + " delivered, " + failed
+                + " failed; native heap after warm-up and at the end " + Arrays.toString(heap);
+        System.out.println(summary);
+        assertEquals(List.of(), problems, "every call once, in its sender's order, as sent: " + summary);
+        assertEquals(0, overlaps(), "host calls never overlap");
+        assertTrue(failed > 0 && delivered > failed, "the host failed some, not most: " + summary);
+        assertTrue(heap[1] - heap[0] < HEAP_MARGIN, "the native heap is flat: " + summary);
     }
 
     /** Sends the calls from `from` to `to` quarters from all senders; returns the native heap once all are served. */
@@ -117,8 +104,7 @@ class SoakTest {
         }
         threads.forEach(Thread::start);
         for (Thread t : threads) t.join();
-        if (!awaitServed(served, WAIT.toMillis() + served / 10))
-            throw new AssertionError(served() + " of " + served + " exchanges: events were lost");
+        assertTrue(awaitServed(served, WAIT.toMillis() + served / 10), served + " exchanges: events lost");
         takeLogLines();  // so that the capture does not grow with the run
         // HotSpot frees its compilers' arena chunks every 5 s of uptime; from then on the JIT moves little.
         Thread.sleep(Math.max(0, 5500 - ManagementFactory.getRuntimeMXBean().getUptime()));
@@ -140,7 +126,7 @@ class SoakTest {
                 if (sender.id < PRODUCERS && part[2].endsWith(" -> 0")) delivered++;
                 else if (sender.id < PRODUCERS) failed++;
                 sender.next();
-                if (!sender.request().equals(part[0].substring("req=".length())))
+                if (!request(sender.row.op(), sender.args).equals(part[0].substring("req=".length())))
                     problem("S" + sender.id + "#" + (sender.seq - 1) + " expected, the host got " + part[2]);
             }
         }
