@@ -1,8 +1,6 @@
-// Any host call with arguments drawn from the input against the device model,
-// under a layout and a reply the input chooses (proper, cut, noise, raw, or a
-// failed exchange): the request follows the wire rules, the guest hands back
-// the guest-bound buffer's bytes, and it stays inside its buffers and the
-// caller's storage. A failed expectation aborts, so libFuzzer keeps the input.
+// Any host call with drawn arguments, under a drawn layout and reply (proper, cut, noise, raw
+// or failed): the request follows the wire rules, the guest hands back the guest-bound bytes
+// and stays inside its buffers. A failed expectation aborts, so libFuzzer keeps the input.
 #include <errno.h>
 #include <fuzzer/FuzzedDataProvider.h>
 
@@ -60,8 +58,7 @@ struct Call {
     }
 };
 
-// Draws the call, and lays out its request as the wire rules do; no reply
-// fits a negative buffer length.
+// Draws the call and lays out its request; no reply fits a negative buffer length.
 std::vector<uint8_t> drawCall(FuzzedDataProvider& in, Call& call, uint64_t& replySize) {
     const hcall::OpInfo& op =
         *(call.op = hcall::findOp(in.ConsumeIntegralInRange<uint32_t>(1, hcall::kNumOps)));
@@ -102,8 +99,7 @@ std::vector<uint8_t> drawCall(FuzzedDataProvider& in, Call& call, uint64_t& repl
 
 VmsgDeviceScript drawScript(FuzzedDataProvider& in) {
     VmsgDeviceScript s;
-    // Room for any call; tight, so that requests and replies meet their limits;
-    // or any placement, overlapping buffers included.
+    // Room for any call; tight, to meet the limits; or any placement, even overlapping.
     const int layout = in.ConsumeIntegralInRange<int>(0, 2);
     const uint32_t most = layout == 0 ? 4096 : layout == 1 ? 400 : 8192;
     s.hostBoundCapacity = layout == 0 ? most : in.ConsumeIntegralInRange<uint32_t>(0, most);
@@ -144,8 +140,7 @@ void callOnce(FuzzedDataProvider& in, bool connected) {
                    "an unanswered call leaves the caller's storage alone");
         return;
     }
-    // Filled data in parameter order, then the result: whatever the guest-bound
-    // buffer holds, which may be what earlier replies left.
+    // Filled data, then the result: whatever the guest-bound buffer holds, even stale.
     const auto* reply = static_cast<const uint8_t*>(c.mGuestBoundBuf);
     for (const Arg& a : call.args) {
         expect(a.size == 0 || std::memcmp(a.filled, reply, a.size) == 0,

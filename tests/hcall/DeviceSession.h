@@ -1,4 +1,4 @@
-// g_hcall connected to the device model, and readers for what the device saw.
+// g_hcall connected to the device model under a script.
 #pragma once
 
 #include "VmsgDeviceModel.h"
@@ -29,10 +29,4 @@ inline VmsgDeviceScript scriptWith(ScriptTweak tweak) {
     VmsgDeviceScript script;
     if (tweak) tweak(script);
     return script;
-}
-
-inline size_t countEvents(VmsgDeviceEventKind kind) {
-    size_t n = 0;
-    for (const VmsgDeviceEvent& event : vmsgDeviceEvents()) n += event.kind == kind;
-    return n;
 }
