@@ -24,24 +24,19 @@ void expect(bool ok, const char* what) {
     std::abort();
 }
 
-// Filled i32 * and u64 * start so, to show a call the host did not answer leaves them alone.
-constexpr int32_t kUntouchedI32 = 0x5A5A5A5A;
-constexpr uint64_t kUntouchedU64 = 0x5A5A5A5A5A5A5A5AULL;
-
 struct Arg {
     std::string text;   // Str: no NUL inside, so c_str() holds all of it
     int32_t value = 0;  // I32; after a Buf it is that buffer's length
     bool flag = false;
     std::unique_ptr<char[]> buffer;  // Buf: exactly its size, so ASan sees any access past it
     std::string before;              // Buf: what it held before the call
-    int32_t outI32 = kUntouchedI32;
-    uint64_t outU64 = kUntouchedU64;
+    int32_t outI32 = 0x5A5A5A5A;     // filled ones start so, to show an unanswered call left them
+    uint64_t outU64 = 0x5A5A5A5A5A5A5A5AULL;
     const void* filled = nullptr;  // Buf, OutI32, OutU64: where the reply's data goes
     uint32_t size = 0;             // and how many bytes of it
     uint32_t word = 0;             // the parameter's first word in the request
 };
 
-// A drawn call, handing its arguments to hcalltest::invokeExported.
 struct Call {
     const hcall::OpInfo* op = nullptr;
     Arg args[hcall::kMaxParams];
@@ -136,7 +131,7 @@ void callOnce(FuzzedDataProvider& in, bool connected) {
         expect(result == (call.op->result == hcall::Flag ? 1 : -1), "unanswered returns -1");
         for (const Arg& a : call.args)
             expect(std::equal(a.before.begin(), a.before.end(), a.buffer.get()) &&
-                       a.outI32 == kUntouchedI32 && a.outU64 == kUntouchedU64,
+                       a.outI32 == Arg().outI32 && a.outU64 == Arg().outU64,
                    "an unanswered call leaves the caller's storage alone");
         return;
     }

@@ -16,7 +16,6 @@
 namespace {
 
 struct Row {
-    std::string where;  // file:line and the exchange
     std::vector<uint8_t> request, reply;
     std::string exchange;
 };
@@ -31,10 +30,9 @@ std::vector<Row> readCorpus() {
         const size_t bar1 = text.find(" | "), bar2 = text.find(" | ", bar1 + 3);
         Row row;
         row.exchange = bar2 == std::string::npos ? "" : text.substr(bar2 + 3);
-        row.where = "hcall_golden.txt:" + std::to_string(line) + " " + row.exchange;
         EXPECT_TRUE(bar2 != std::string::npos && hcallParseHex(text.substr(0, bar1), row.request) &&
                     hcallParseHex(text.substr(bar1 + 3, bar2 - bar1 - 3), row.reply))
-            << row.where << ": not request | reply | exchange";
+            << "hcall_golden.txt:" << line << ": not request | reply | exchange";
         rows.push_back(row);
     }
     return rows;
@@ -88,7 +86,7 @@ struct GuestCall {
 TEST(HcallGolden, Host_ReadsEveryRowAndBuildsItsReply) {
     bool seen[hcall::kNumOps + 1] = {};
     for (const Row& row : readCorpus()) {
-        SCOPED_TRACE(row.where);
+        SCOPED_TRACE(row.exchange);
         HcallRequest request = hcallParseRequest(row.request.data(), row.request.size());
         ASSERT_TRUE(request.ok()) << hcallFaultText(request);
         seen[request.opCode] = true;
@@ -110,7 +108,7 @@ TEST(HcallGolden, Host_ReadsEveryRowAndBuildsItsReply) {
 TEST(HcallGolden, Guest_SendsEveryRowAndReadsItsReply) {
     LogRecorder log(XLOG_LEVEL_E);  // quiet: lines are checked in HcallLog_test
     for (const Row& row : readCorpus()) {
-        SCOPED_TRACE(row.where);
+        SCOPED_TRACE(row.exchange);
         VmsgDeviceScript script;
         script.replyMode = VmsgDeviceReplyMode::Raw;
         script.rawReply = row.reply;
