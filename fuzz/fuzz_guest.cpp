@@ -43,13 +43,12 @@ struct Call {
 
     template <hcall::Kind K>
     auto get(size_t i) {
-        Arg& a = args[i];
-        if constexpr (K == hcall::Str) return a.text.c_str();
-        if constexpr (K == hcall::I32) return a.value;
-        if constexpr (K == hcall::Bool) return a.flag;
-        if constexpr (K == hcall::Buf) return a.buffer.get();
-        if constexpr (K == hcall::OutI32) return &a.outI32;
-        if constexpr (K == hcall::OutU64) return &a.outU64;
+        if constexpr (K == hcall::Str) return args[i].text.c_str();
+        if constexpr (K == hcall::I32) return args[i].value;
+        if constexpr (K == hcall::Bool) return args[i].flag;
+        if constexpr (K == hcall::Buf) return args[i].buffer.get();
+        if constexpr (K == hcall::OutI32) return &args[i].outI32;
+        if constexpr (K == hcall::OutU64) return &args[i].outU64;
     }
 };
 

@@ -16,8 +16,8 @@
 namespace {
 
 struct Row {
-    std::vector<uint8_t> request, reply;
     std::string exchange;
+    std::vector<uint8_t> request, reply;
 };
 
 // Lines of "request hex | reply hex | exchange"; "#" starts a comment.
@@ -28,8 +28,7 @@ std::vector<Row> readCorpus() {
     for (int line = 1; std::getline(in, text); ++line) {
         if (text.find_first_not_of(' ') == std::string::npos || text[0] == '#') continue;
         const size_t bar1 = text.find(" | "), bar2 = text.find(" | ", bar1 + 3);
-        Row row;
-        row.exchange = bar2 == std::string::npos ? "" : text.substr(bar2 + 3);
+        Row row{bar2 == std::string::npos ? "" : text.substr(bar2 + 3), {}, {}};
         EXPECT_TRUE(bar2 != std::string::npos && hcallParseHex(text.substr(0, bar1), row.request) &&
                     hcallParseHex(text.substr(bar1 + 3, bar2 - bar1 - 3), row.reply))
             << "hcall_golden.txt:" << line << ": not request | reply | exchange";

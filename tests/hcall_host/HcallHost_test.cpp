@@ -88,8 +88,7 @@ TEST(HcallHost, Reply_ShortOrWithStrayBytes_ReadsAsTheGuestReadsIt) {
     r.params[0].text = "0123456789";
     ASSERT_EQ(hcallBuildReply(r, -1, out.data(), out.size()), 12u);
     EXPECT_EQ(out, hex("30313233 00000000 FFFFFFFF")) << "a long text is cut to the capacity";
-    r.params[0].text = "a";
-    r.params[2].i32 = 9;
+    r.params[0].text = "a", r.params[2].i32 = 9;
     ASSERT_EQ(hcallBuildReply(r, 0, out.data(), out.size()), 12u);
     EXPECT_EQ(out, hex("61000000 09000000 00000000")) << "a short text is NUL-padded";
     EXPECT_EQ(hcallBuildReply(r, 0, out.data(), 11), 0u) << "11 bytes cannot hold the reply";
