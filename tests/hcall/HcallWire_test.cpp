@@ -124,16 +124,14 @@ TEST(HcallThreads, Calls_FromSeveralThreadsAtOnce_NeverOverlapAndEachGetsItsOwnR
                    std::string(buffer) == "props" && value == 123;
         },
     };
-    constexpr int kCalls = 200;  // per thread
     Gate start;
     std::vector<int> wrong(callers.size(), 0);
     std::vector<std::thread> threads;
-    for (size_t t = 0; t < callers.size(); ++t) {
+    for (size_t t = 0; t < callers.size(); ++t)
         threads.emplace_back([&, t] {
             start.wait();
-            for (int i = 0; i < kCalls; ++i) wrong[t] += !callers[t]();
+            for (int i = 0; i < 200; ++i) wrong[t] += !callers[t]();  // 200 calls per thread
         });
-    }
     start.open();
     for (std::thread& thread : threads) thread.join();
     EXPECT_EQ(wrong, std::vector<int>(callers.size(), 0)) << "calls got another call's reply";
