@@ -1,8 +1,6 @@
-// Any host call with arguments drawn from the input against the device model,
-// under a layout and a reply the input chooses (proper, cut, noise, raw, or a
-// failed exchange): the request follows the wire rules, the guest hands back
-// the guest-bound buffer's bytes, and it stays inside its buffers and the
-// caller's storage. A failed expectation aborts, so libFuzzer keeps the input.
+// Any host call with drawn arguments, under a drawn layout and reply (proper, cut, noise, raw
+// or failed): the request follows the wire rules, the guest hands back the guest-bound bytes
+// and stays inside its buffers. A failed expectation aborts, so libFuzzer keeps the input.
 #include <errno.h>
 #include <fuzzer/FuzzedDataProvider.h>
 
@@ -26,42 +24,35 @@ void expect(bool ok, const char* what) {
     std::abort();
 }
 
-// Filled i32 * and u64 * start so, to show a call the host did not answer leaves them alone.
-constexpr int32_t kUntouchedI32 = 0x5A5A5A5A;
-constexpr uint64_t kUntouchedU64 = 0x5A5A5A5A5A5A5A5AULL;
-
 struct Arg {
     std::string text;   // Str: no NUL inside, so c_str() holds all of it
     int32_t value = 0;  // I32; after a Buf it is that buffer's length
     bool flag = false;
     std::unique_ptr<char[]> buffer;  // Buf: exactly its size, so ASan sees any access past it
     std::string before;              // Buf: what it held before the call
-    int32_t outI32 = kUntouchedI32;
-    uint64_t outU64 = kUntouchedU64;
+    int32_t outI32 = 0x5A5A5A5A;     // filled ones start so, to show an unanswered call left them
+    uint64_t outU64 = 0x5A5A5A5A5A5A5A5AULL;
     const void* filled = nullptr;  // Buf, OutI32, OutU64: where the reply's data goes
     uint32_t size = 0;             // and how many bytes of it
     uint32_t word = 0;             // the parameter's first word in the request
 };
 
-// A drawn call, handing its arguments to hcalltest::invokeExported.
 struct Call {
     const hcall::OpInfo* op = nullptr;
     Arg args[hcall::kMaxParams];
 
     template <hcall::Kind K>
     auto get(size_t i) {
-        Arg& a = args[i];
-        if constexpr (K == hcall::Str) return a.text.c_str();
-        if constexpr (K == hcall::I32) return a.value;
-        if constexpr (K == hcall::Bool) return a.flag;
-        if constexpr (K == hcall::Buf) return a.buffer.get();
-        if constexpr (K == hcall::OutI32) return &a.outI32;
-        if constexpr (K == hcall::OutU64) return &a.outU64;
+        if constexpr (K == hcall::Str) return args[i].text.c_str();
+        if constexpr (K == hcall::I32) return args[i].value;
+        if constexpr (K == hcall::Bool) return args[i].flag;
+        if constexpr (K == hcall::Buf) return args[i].buffer.get();
+        if constexpr (K == hcall::OutI32) return &args[i].outI32;
+        if constexpr (K == hcall::OutU64) return &args[i].outU64;
     }
 };
 
-// Draws the call, and lays out its request as the wire rules do; no reply
-// fits a negative buffer length.
+// Draws the call and lays out its request; no reply fits a negative buffer length.
 std::vector<uint8_t> drawCall(FuzzedDataProvider& in, Call& call, uint64_t& replySize) {
     const hcall::OpInfo& op =
         *(call.op = hcall::findOp(in.ConsumeIntegralInRange<uint32_t>(1, hcall::kNumOps)));
@@ -102,8 +93,7 @@ std::vector<uint8_t> drawCall(FuzzedDataProvider& in, Call& call, uint64_t& repl
 
 VmsgDeviceScript drawScript(FuzzedDataProvider& in) {
     VmsgDeviceScript s;
-    // Room for any call; tight, so that requests and replies meet their limits;
-    // or any placement, overlapping buffers included.
+    // Room for any call; tight, to meet the limits; or any placement, even overlapping.
     const int layout = in.ConsumeIntegralInRange<int>(0, 2);
     const uint32_t most = layout == 0 ? 4096 : layout == 1 ? 400 : 8192;
     s.hostBoundCapacity = layout == 0 ? most : in.ConsumeIntegralInRange<uint32_t>(0, most);
@@ -140,12 +130,11 @@ void callOnce(FuzzedDataProvider& in, bool connected) {
         expect(result == (call.op->result == hcall::Flag ? 1 : -1), "unanswered returns -1");
         for (const Arg& a : call.args)
             expect(std::equal(a.before.begin(), a.before.end(), a.buffer.get()) &&
-                       a.outI32 == kUntouchedI32 && a.outU64 == kUntouchedU64,
+                       a.outI32 == Arg().outI32 && a.outU64 == Arg().outU64,
                    "an unanswered call leaves the caller's storage alone");
         return;
     }
-    // Filled data in parameter order, then the result: whatever the guest-bound
-    // buffer holds, which may be what earlier replies left.
+    // Filled data, then the result: whatever the guest-bound buffer holds, even stale.
     const auto* reply = static_cast<const uint8_t*>(c.mGuestBoundBuf);
     for (const Arg& a : call.args) {
         expect(a.size == 0 || std::memcmp(a.filled, reply, a.size) == 0,

@@ -1,7 +1,6 @@
 #!/usr/bin/env bash
-# Runs the fuzz target of a fuzz build for a bounded time on a working copy of
-# its seeds; fails on a crash, a failed expectation or a hang. The working
-# corpus and any crashing input stay in BUILD_DIR/fuzz-work/fuzz_guest/.
+# Runs the fuzz target for a bounded time on a copy of its seeds; fails on a crash, a failed
+# expectation or a hang. Corpus and crashing inputs stay in BUILD_DIR/fuzz-work/fuzz_guest/.
 # Usage: fuzz/run-fuzz.sh BUILD_DIR [SECONDS]
 set -euo pipefail
 build=${1:?usage: run-fuzz.sh BUILD_DIR [SECONDS]}

@@ -1,10 +1,9 @@
-// g_hcall connected to the device model, and readers for what the device saw.
+// g_hcall on the device model under a script for an object's life: every test starts alike.
 #pragma once
 
 #include "VmsgDeviceModel.h"
 #include "hcall/guest/HcallEnc.h"
 
-// g_hcall connected under a script for the object's life, so every test starts alike.
 struct HcallSession {
     explicit HcallSession(const VmsgDeviceScript& script = {}) : connected(start(script)) {}
     ~HcallSession() {
@@ -29,10 +28,4 @@ inline VmsgDeviceScript scriptWith(ScriptTweak tweak) {
     VmsgDeviceScript script;
     if (tweak) tweak(script);
     return script;
-}
-
-inline size_t countEvents(VmsgDeviceEventKind kind) {
-    size_t n = 0;
-    for (const VmsgDeviceEvent& event : vmsgDeviceEvents()) n += event.kind == kind;
-    return n;
 }

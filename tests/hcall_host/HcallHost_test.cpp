@@ -1,6 +1,5 @@
-// The host half beyond the golden corpus (tests/hcall/HcallGolden_test.cpp):
-// requests it refuses and why, replies no proper host builds, and what the
-// dispatcher hands a handler.
+// The host half beyond the golden corpus: requests it refuses and why, odd replies, and
+// what the dispatcher hands a handler.
 
 #include "hcall/host/HcallHost.h"
 
@@ -77,7 +76,6 @@ TEST(HcallHost, Reply_ShortOrWithStrayBytes_ReadsAsTheGuestReadsIt) {
     } rows[] = {
         {kProps, "61626300 00000000",
          "hcallGetPropsRpc(char[8]=\"abc\", 8, i32*) -> !short reply: 8 of 16 bytes"},
-        {kProps, "61626300", "hcallGetPropsRpc(char[8], 8, i32*) -> !short reply: 4 of 16 bytes"},
         {launch, "00FFFFFF", "hcallIsAppLaunchAllowedRpc(\"p\") -> false"},
         {launch, "02000000", "hcallIsAppLaunchAllowedRpc(\"p\") -> true"},
     };
@@ -90,8 +88,7 @@ TEST(HcallHost, Reply_ShortOrWithStrayBytes_ReadsAsTheGuestReadsIt) {
     r.params[0].text = "0123456789";
     ASSERT_EQ(hcallBuildReply(r, -1, out.data(), out.size()), 12u);
     EXPECT_EQ(out, hex("30313233 00000000 FFFFFFFF")) << "a long text is cut to the capacity";
-    r.params[0].text = "a";
-    r.params[2].i32 = 9;
+    r.params[0].text = "a", r.params[2].i32 = 9;
     ASSERT_EQ(hcallBuildReply(r, 0, out.data(), out.size()), 12u);
     EXPECT_EQ(out, hex("61000000 09000000 00000000")) << "a short text is NUL-padded";
     EXPECT_EQ(hcallBuildReply(r, 0, out.data(), 11), 0u) << "11 bytes cannot hold the reply";
@@ -155,10 +152,9 @@ TEST(HcallHost, Dispatch_HandsEachEntryItsValuesAndRepliesWithItsAnswer) {
 
 TEST(HcallHost, ParseHex_TakesBlanksBetweenBytesOnly) {
     std::vector<uint8_t> bytes;
-    EXPECT_TRUE(hcallParseHex("0a0B 0c,\t0D", bytes));
-    EXPECT_EQ(bytes, (std::vector<uint8_t>{0x0A, 0x0B, 0x0C, 0x0D}));
+    EXPECT_TRUE(hcallParseHex("0a0B c0,\tFD", bytes));
+    EXPECT_EQ(hcallHex(bytes.data(), bytes.size()), "0a0bc0fd");
     for (const char* bad : {"0a 0", "0 a", "0g"}) EXPECT_FALSE(hcallParseHex(bad, bytes)) << bad;
-    EXPECT_EQ(hcallHex(reinterpret_cast<const uint8_t*>("\x01\xAB"), 2), "01ab");
 }
 
 }  // namespace
