@@ -5,24 +5,19 @@
 #include <fuzzer/FuzzedDataProvider.h>
 
 #include <algorithm>
-#include <cstdio>
-#include <cstdlib>
 #include <cstring>
 #include <memory>
 #include <string>
 #include <vector>
 
+#include "FuzzCheck.h"
 #include "hcall/DeviceSession.h"
 #include "support/HcallInvoke.h"
 #include "support/LogRecorder.h"
 
 namespace {
 
-void expect(bool ok, const char* what) {
-    if (ok) return;
-    std::fprintf(stderr, "fuzz expectation failed: %s\n", what);
-    std::abort();
-}
+using fuzz::expect;
 
 struct Arg {
     std::string text;   // Str: no NUL inside, so c_str() holds all of it

@@ -60,37 +60,49 @@ TEST(HcallWire, Call_AgainstTheLimitsAndFailures_IsSentOrRefused) {
         int64_t (*call)();
         int64_t want;
         size_t sent;  // exchanges that reached the host
-    } rows[] = {
-        {"request at host-bound capacity", host64, [] { return locale(51); }, 0, 1},
-        {"request one over host-bound capacity", host64, [] { return locale(52); }, -1, 0},
-        // Regression: an unchecked reply length read a large buffer from beyond the mapping.
-        {"reply at guest-bound capacity", guest72, [] { return props(64); }, 0, 1},
-        {"reply one over guest-bound capacity", guest72, [] { return props(65); }, -1, 0},
-        // Regression: a negative buffer length became a 4 GiB copy.
-        {"buffer length -1", nullptr, [] { return props(-1); }, -1, 0},
-        {"buffer length INT32_MIN", nullptr,
-         [] { return int64_t(hcallGetTimeInfoRpc(&gTime, gBuffer, INT32_MIN)); }, -1, 0},
-        {"exchange fails", [](VmsgDeviceScript& s) { s.sendErrno = EPIPE; },
-         [] { return props(8); }, -1, 1},
-        // The launch answer is the reply's first byte alone.
-        {"launch, reply byte 2", [](VmsgDeviceScript& s) { rawReply(s, 2); }, launch, 1, 1},
-        {"launch, reply byte 0", [](VmsgDeviceScript& s) { rawReply(s, 0); }, launch, 0, 1},
-        // Chosen: a host that cannot be asked does not veto launches.
-        {"unconnected, the launch query", noDevice, launch, 1, 0},
+        const char* errors = "";
+    } rows[] =
+    { {"request at host-bound capacity", host64, [] { return locale(51); }, 0, 1},
+      {"request one over host-bound capacity", host64, [] { return locale(52); }, -1, 0,
+       "void *VmsgGuestClient::getHostBoundBuffer(uint32_t):119 len 65, mMaxHostBoundSize 64|"},
+      // Regression: an unchecked reply length read a large buffer from beyond the mapping.
+      {"reply at guest-bound capacity", guest72, [] { return props(64); }, 0, 1},
+      {"reply one over guest-bound capacity", guest72, [] { return props(65); }, -1, 0,
+       "xerr_t hcallGetPropsRpc(char *, i32, i32 *): reply of 73 bytes, mMaxGuestBoundSize 72|"},
+      // Regression: a negative buffer length became a 4 GiB copy.
+      {"buffer length -1", nullptr, [] { return props(-1); }, -1, 0,
+       "xerr_t hcallGetPropsRpc(char *, i32, i32 *): negative buffer length|"},
+      {"buffer length INT32_MIN", nullptr,
+       [] { return int64_t(hcallGetTimeInfoRpc(&gTime, gBuffer, INT32_MIN)); }, -1, 0,
+       "xerr_t hcallGetTimeInfoRpc(u64 *, char *, i32): negative buffer length|"},
+      {"exchange fails", [](VmsgDeviceScript& s) { s.sendErrno = EPIPE; }, [] { return props(8); },
+       -1, 1,
+       "void *VmsgGuestClient::processRequest(void *, uint32_t): service hcal: SEND_RECEIVE ioctl "
+       "failed: ret -1, errno 32|"},
+      // The launch answer is the reply's first byte alone.
+      {"launch, reply byte 2", [](VmsgDeviceScript& s) { rawReply(s, 2); }, launch, 1, 1},
+      {"launch, reply byte 0", [](VmsgDeviceScript& s) { rawReply(s, 0); }, launch, 0, 1},
+      // Chosen: a host that cannot be asked does not veto launches.
+      {"unconnected, the launch query", noDevice, launch, 1, 0,
+       "bool VmsgGuestClient::connect(VmsgServiceId): service hcal: open failed for /dev/kivvmsg|"
+       "void *VmsgGuestClient::getHostBoundBuffer(uint32_t): service hcal: not connected|"},
 #if !defined(__SANITIZE_THREAD__)  // which would shadow every byte of the 4 GiB of strings
-        // Regression: a length summed in 32 bits wrapped to a small one and the strings were
-        // copied past the shared buffer. Six make 46 + 6 * 715827890 = 2^32 + 90 bytes.
-        {"request whose length wraps in 32 bits", nullptr,
-         [] {
-             const char* s = huge();
-             return int64_t(hcallOnAppInstalledRpc(s, s, s, 1, s, s, s, false));
-         },
-         -1, 0},
+      // Regression: a length summed in 32 bits wrapped to a small one and the strings were
+      // copied past the shared buffer. Six make 46 + 6 * 715827890 = 2^32 + 90 bytes.
+      {"request whose length wraps in 32 bits", nullptr,
+       [] {
+           const char* s = huge();
+           return int64_t(hcallOnAppInstalledRpc(s, s, s, 1, s, s, s, false));
+       },
+       -1, 0,
+       "xerr_t hcallOnAppInstalledRpc(const char *, const char *, const char *, i32, const char *, "
+       "const char *, const char *, bool): request of 4294967386 bytes, mMaxHostBoundSize 65536|"},
 #endif
     };
-    LogRecorder log(XLOG_LEVEL_E);  // quiet: lines are checked in HcallLog_test
+    LogRecorder log(XLOG_LEVEL_E);
     for (const auto& row : rows) {
         SCOPED_TRACE(row.name);
+        log.clear();
         const VmsgDeviceScript script = scriptWith(row.tweak);
         HcallSession session(script);
         ASSERT_EQ(session.connected, script.openErrno == 0);
@@ -99,6 +111,10 @@ TEST(HcallWire, Call_AgainstTheLimitsAndFailures_IsSentOrRefused) {
         EXPECT_EQ(row.call(), row.want);
         EXPECT_EQ(vmsgDeviceExchanges().size(), row.sent);
         EXPECT_TRUE(!session.connected || row.sent > 0 || request[0] == 0xEE) << "written";
+        std::string errors;
+        for (int module : {XLOG_MODULE_VMSG, XLOG_MODULE_HCALL})
+            for (const LoggedLine& line : log.lines(module)) errors += line.text + "|";
+        EXPECT_EQ(errors, row.errors);
     }
 }
 
