@@ -3,6 +3,7 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <memory>
 #include <string>
 #include <thread>
@@ -18,7 +19,11 @@
 static std::string startAgain() {
     xlogSetLevels("HCALL:V");
     bridge::startService();
-    if (countEvents(VmsgDeviceEventKind::Connect) != 1) return "not one connection";
+    const std::vector<VmsgDeviceEvent> events = vmsgDeviceEvents();
+    if (std::count_if(events.begin(), events.end(), [](const VmsgDeviceEvent& e) {
+            return e.kind == VmsgDeviceEventKind::Connect;
+        }) != 1)
+        return "not one connection";
     if (!xlogShouldLog(XLOG_MODULE_HCALL, XLOG_LEVEL_V)) return "the levels were reset";
     return g_thr_pool.numActive == 1 ? "" : std::to_string(g_thr_pool.numActive) + " workers";
 }
