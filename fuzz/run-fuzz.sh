@@ -6,7 +6,7 @@ set -euo pipefail
 build=${1:?usage: run-fuzz.sh BUILD_DIR [SECONDS_PER_TARGET]}
 seconds=${2:-60}
 failed=0
-for target in fuzz_hcall_decode fuzz_guest; do
+for target in fuzz_hcall_decode fuzz_level_split fuzz_guest; do
   work=$build/fuzz-work/$target
   mkdir -p "$work/corpus" "$work/artifacts"
   cp -n "$(dirname "$0")/corpus/$target"/* "$work/corpus/" || true  # seeds join earlier finds
