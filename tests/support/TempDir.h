@@ -1,11 +1,10 @@
 // A fresh folder under /tmp, removed with all it holds when it goes out of scope.
 #pragma once
 
-#include <ftw.h>
 #include <stdlib.h>
 #include <sys/stat.h>
 
-#include <cstdio>
+#include <filesystem>
 #include <fstream>
 #include <sstream>
 #include <string>
@@ -17,10 +16,8 @@ class TempDir {
         if (mkdtemp(pattern) != nullptr) path_ = pattern;
     }
     ~TempDir() {
-        auto remove = [](const char* path, const struct stat*, int, struct FTW*) {
-            return std::remove(path);
-        };
-        if (!path_.empty()) (void)nftw(path_.c_str(), remove, 16, FTW_DEPTH | FTW_PHYS);
+        std::error_code ignored;
+        if (!path_.empty()) std::filesystem::remove_all(path_, ignored);
     }
     TempDir(const TempDir&) = delete;
     TempDir& operator=(const TempDir&) = delete;
