@@ -36,7 +36,7 @@ void rawReply(VmsgDeviceScript& s, uint8_t first) {
 void noDevice(VmsgDeviceScript& s) { s.openErrno = ENOENT; }
 
 // 715827890 bytes of 'a', then a NUL, in little memory: one MiB mapped over and over.
-const char* huge() {
+[[maybe_unused]] const char* huge() {
     const size_t length = 715827890, tile = 1 << 20, tail = length - length % tile;
     const int fd = memfd_create("huge-string", 0);
     if (ftruncate(fd, tile) != 0) return "";
