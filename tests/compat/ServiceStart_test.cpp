@@ -25,6 +25,7 @@ static std::string startAgain() {
         }) != 1)
         return "not one connection";
     if (!xlogShouldLog(XLOG_MODULE_HCALL, XLOG_LEVEL_V)) return "the levels were reset";
+    if (!g_xlog->fileName.empty()) return "a log file was opened";
     return g_thr_pool.numActive == 1 ? "" : std::to_string(g_thr_pool.numActive) + " workers";
 }
 

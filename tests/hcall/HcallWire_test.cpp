@@ -113,7 +113,12 @@ TEST(HcallWire, Call_AgainstTheLimitsAndFailures_IsSentOrRefused) {
         EXPECT_TRUE(!session.connected || row.sent > 0 || request[0] == 0xEE) << "written";
         std::string errors;
         for (int module : {XLOG_MODULE_VMSG, XLOG_MODULE_HCALL})
-            for (const LoggedLine& line : log.lines(module)) errors += line.text + "|";
+            for (const LoggedLine& line : log.lines(module)) {
+                errors += line.text + "|";
+                EXPECT_EQ(line.function.find("VmsgGuestClient::") == std::string::npos,
+                          module == XLOG_MODULE_HCALL)
+                    << "module of " << line.text;
+            }
         EXPECT_EQ(errors, row.errors);
     }
 }

@@ -3,6 +3,7 @@
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <sys/mman.h>
 
 #include <cerrno>
 #include <string>
@@ -65,6 +66,7 @@ TEST(VmsgGuestClient, ConnectThenDisconnect_FollowTheDevice) {
     EXPECT_EQ(events[0].request, 0x7602UL);
     EXPECT_EQ(events[1].kind, VmsgDeviceEventKind::Close);
     EXPECT_EQ(c.mHostBoundBuf, host) << "the record keeps its values";
+    EXPECT_NE(msync(static_cast<char*>(host) + 8192, 4096, MS_ASYNC), 0) << "all of it unmapped";
     EXPECT_EQ(c.mServiceName, "hcal");
     trace = log.lines(XLOG_MODULE_VMSG);
     ASSERT_EQ(trace.size(), 2u) << "each disconnect prints its called-for line";

@@ -50,6 +50,9 @@ TEST(ThreadCreateFailure,
     xthrPoolAddTask(&pool, [&] { second.open(), runs += first.wait(); });
     xthrPoolFini(&pool);
     EXPECT_EQ(runs * 10 + pool.numActive, 20);
+    pool.~ThreadPool();  // a caller still adding at exit meets this
+    EXPECT_EQ(xthrPoolAddTask(&pool, [] {}), XERR_FAILURE) << "refused, and no caller error";
+    new (&pool) ThreadPool();
 }
 
 // Regression: a failed creation left the lock held or the flag set with no

@@ -101,7 +101,7 @@ TEST_F(XfileTest, ReadAll_WhenDataComesInPiecesAndSignalsInterrupt_FillsTheBuffe
 
 TEST_F(XfileTest, Folders_AreMadeWithTheirAncestorsUpTo4096Bytes) {
     dir_.write("plain", "x");
-    ASSERT_EQ(mkfifo((dir_ / "fifo").c_str(), 0600), 0);
+    ASSERT_EQ(mkfifo((dir_ / "fifo").c_str(), 0600) + symlink("plain", (dir_ / "link").c_str()), 0);
     auto longPath = [&](size_t length) {
         std::string path = dir_ / std::to_string(length);
         while (path.size() < length) path += "/" + std::string(200, 'd');
@@ -111,7 +111,8 @@ TEST_F(XfileTest, Folders_AreMadeWithTheirAncestorsUpTo4096Bytes) {
         {dir_ / "a/b//c/", XERR_SUCCESS, XERR_SUCCESS},
         {dir_ / "a/b", XERR_SUCCESS, XERR_SUCCESS},
         {dir_ / "plain", XERR_SUCCESS, XERR_SUCCESS},
-        {dir_ / "fifo", XERR_SUCCESS, XERR_NOENT},  // a pipe counts as missing
+        {dir_ / "link", XERR_SUCCESS, XERR_SUCCESS},  // a link counts as what it names
+        {dir_ / "fifo", XERR_SUCCESS, XERR_NOENT},    // a pipe counts as missing
         {dir_ / "plain/under", XERR_NOTDIR, XERR_NOTDIR},
         {"", XERR_NOENT, XERR_NOENT},
         {longPath(4095), XERR_SUCCESS, XERR_SUCCESS},

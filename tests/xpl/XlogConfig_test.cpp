@@ -112,6 +112,9 @@ TEST(XlogConfig, SetFile_AppendsAndRotatesFromTheThresholdOn) {
     EXPECT_EQ(std::filesystem::file_size(logFile), 8) << "appended, never truncated";
     const int fd = g_xlog->file.fd;
     EXPECT_EQ(xlogSetFile(""), XERR_SUCCESS);
+    xlogSetProcessTag("svc"), xlogSetFormat(true, true, false);
+    const bool* f = g_xlog->formatFlags;
+    EXPECT_EQ(g_xlog->processTag + std::to_string(f[0] * 100 + f[1] * 10 + f[2]), "svc110");
     EXPECT_EQ(g_xlog->fileName + std::to_string(g_xlog->file.fd), logFile + std::to_string(fd))
         << "an empty name changes nothing";
     constexpr long long kRotateSize = 10485760;

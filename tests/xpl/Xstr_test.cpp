@@ -3,7 +3,10 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cstdio>
+
+#include "xpl/Xmem.h"
 
 namespace {
 
@@ -64,11 +67,26 @@ TEST(Xstr, TrimFoldAndSplit_ChangeOnlyWhiteSpaceAndAsciiLetters) {
 // which was taken as a length and turned into a huge allocation.
 TEST(Xstr, Printf_HoldsTheWholeOutput) {
     const std::string big(5000, 'q');
-    EXPECT_EQ(xstrPrintf("%d-%s", 42, "x") + xstrPrintf("%s", ""), "42-x");
+    EXPECT_EQ(xstrPrintf("%d-", 42) + xstrPrintf("%s", "") + xstrPrintf("%c", 'x'), "42-x");
     EXPECT_EQ(xstrPrintf("<%s>", big.c_str()), "<" + big + ">") << "no fixed buffer";
     const wchar_t notInCLocale[] = {0xE9, 0};
     ASSERT_LT(std::snprintf(nullptr, 0, "%ls", notInCLocale), 0);
     EXPECT_EQ(xstrPrintf("%ls", notInCLocale), "");
+}
+
+// Blocks the allocator hands out again hold 'x': a byte left unwritten shows.
+TEST(Xstr, CHelpers_CopyTheTerminatorAndCountWhatTheyRead) {
+    char area[8] = "#######";
+    EXPECT_STREQ(xstr_ncpy(area, "abc", 4), "abc");
+    EXPECT_STREQ(static_cast<char*>(xmem_set(area, 'z', 2)), "zzc");
+    int a = 0, b = 0;
+    EXPECT_EQ(xstr_sscanf("7 8", "%d %d", &a, &b) * 100 + a * 10 + b, 278);
+    void* used[] = {xmem_alloc(18), xmem_alloc(18)};
+    for (void* p : used) xmem_free(xmem_set(p, 'x', 18));  // bytes past 16 stay as set
+    char* copy = xstr_dup("seventeen letters");
+    auto* zeros = static_cast<char*>(xmem_calloc(18, 1));
+    EXPECT_EQ(copy + std::to_string(std::count(zeros, zeros + 18, 0)), "seventeen letters18");
+    xmem_free(copy), xmem_free(zeros);
 }
 
 }  // namespace

@@ -4,6 +4,7 @@
 
 #include <gtest/gtest.h>
 #include <sys/time.h>
+#include <unistd.h>
 
 #include <ctime>
 
@@ -59,6 +60,8 @@ TEST(Xtime, BaseConversionAndLogStamp_FollowTheZone) {
             }
             if (xlogLibInit(nullptr, "", "") != XERR_SUCCESS) return "start-up failed";
             char stamp[64];
+            // Stamped in the first tenth of a second: the milliseconds show their zeros.
+            while (localWallClock() % kSecond >= 100000) usleep(1000);
             before = localWallClock();
             xlogCurrentTime(stamp, sizeof(stamp));
             const std::string first = stampOf(before) + offset;
@@ -87,7 +90,9 @@ TEST(Xtime, Strf_FormatsWholeSecondsAsUtcLeavingTheSharedRecordAlone) {
         size_t length = xtimeStrf(buf, size, format, t);
         EXPECT_EQ(std::string(buf, std::min(length, sizeof(buf))), want) << t;
     }
-    xtimeNow();
+    const long long start = xtimeNow();
+    xtimeSleep(20000);
+    EXPECT_GE(xtimeNow() - start, 20000) << "a sleep is never cut short";
     xtimeToUtc(12345 * kSecond);
     EXPECT_EQ(shared->tm_hour * 1000 + shared->tm_yday, 0);
 }
