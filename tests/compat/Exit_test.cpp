@@ -15,6 +15,7 @@
 #include "hcall/guest/HcallEnc.h"
 #include "support/ChildProcess.h"
 #include "support/Gate.h"
+#include "support/LogRecorder.h"
 #include "xpl/XthrPool.h"
 #include "xpl/Xtimer.h"
 
@@ -114,6 +115,16 @@ TEST(Exit, Exit_WhileTheLibrarysThreadsWork_EndsCleanly) {
              xthrPoolAddTask(&g_thr_pool, [witness] { childReport("queued task ran\n"); });
              witness.reset();
              started.wait();
+         }},
+        // Once g_hcall is torn down, a late call is refused without a word.
+        {"a call after the connection closed", 1,
+         [] {
+             connect();
+             gProbe->afterExit = [] {
+                 static LogRecorder* const log = new LogRecorder();
+                 if (hcallOnOrientationChangedRpc(1) != -1 || !log->lines(XLOG_MODULE_VMSG).empty())
+                     childReport("a late call was not refused silently\n");
+             };
          }},
         // Regression: destroying the condition variable a worker waited on
         // hung the exit in glibc. A timer not yet due never runs.
