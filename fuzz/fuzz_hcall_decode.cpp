@@ -4,7 +4,6 @@
 // refuses it must say why. tests/hcall_host tables each framing rule.
 #include <algorithm>
 #include <cstring>
-#include <memory>
 #include <string>
 #include <vector>
 
@@ -15,28 +14,22 @@ namespace {
 
 using fuzz::expect;
 
-// Bytes in an allocation of exactly their size, so ASan sees any read past it.
-struct Exact {
-    Exact(const uint8_t* data, size_t size) : bytes(new uint8_t[size]), size(size) {
-        if (size != 0) std::memcpy(bytes.get(), data, size);
-    }
-    std::unique_ptr<uint8_t[]> bytes;
-    size_t size;
-};
+// Exactly the input's bytes in an allocation of their own, so ASan sees any read past them.
+using Exact = std::vector<uint8_t>;
 
 bool decode(const Exact& req, const Exact* reply, HcallLimits limits = {}) {
-    HcallRequest r = hcallParseRequest(req.bytes.get(), req.size, limits);
+    HcallRequest r = hcallParseRequest(req.data(), req.size(), limits);
     const std::string text =
-        reply ? hcallExchangeText(r, reply->bytes.get(), reply->size) : hcallCallText(r);
+        reply ? hcallExchangeText(r, reply->data(), reply->size()) : hcallCallText(r);
     expect(r.ok() == hcallFaultText(r).empty(), "a rejected request says why");
     expect(!text.empty(), "every request gets a line");
     if (!r.ok() || reply == nullptr) return r.ok();
-    if (reply->size < r.replySize) {
+    if (reply->size() < r.replySize) {
         expect(text.find(" -> !short reply: ") != std::string::npos, "a short reply is told");
         return true;
     }
     // Read back, the reply builds the same bytes; a bool result as 01 or 00.
-    std::vector<uint8_t> want(reply->bytes.get(), reply->bytes.get() + r.replySize), built(want);
+    std::vector<uint8_t> want(reply->begin(), reply->begin() + r.replySize), built(want);
     uint8_t* word = want.data() + want.size() - 4;
     const std::string shown = r.op->result == hcall::Flag
                                   ? (word[0] ? " -> true" : " -> false")
@@ -46,7 +39,7 @@ bool decode(const Exact& req, const Exact* reply, HcallLimits limits = {}) {
            "the answer shown is the reply's last word");
     if (r.op->result == hcall::Flag) word[0] = word[0] != 0, word[1] = word[2] = word[3] = 0;
     int32_t result = 0;
-    expect(hcallReadReply(r, reply->bytes.get(), r.replySize, result), "a whole reply reads");
+    expect(hcallReadReply(r, reply->data(), r.replySize, result), "a whole reply reads");
     expect(hcallBuildReply(r, result, built.data(), built.size()) == r.replySize && built == want,
            "the reply builds back from what was read");
     return true;
@@ -56,7 +49,8 @@ bool decode(const Exact& req, const Exact* reply, HcallLimits limits = {}) {
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     const size_t length = size >= 8 ? std::min<size_t>(size, fuzz::le32(data + 4)) : size;
-    const Exact request(data, length), reply(data + length, size - length), whole(data, size);
+    const Exact request(data, data + length), reply(data + length, data + size),
+        whole(data, data + size);
     decode(whole, nullptr);
     if (!decode(request, &reply)) return 0;
     const uint32_t total = fuzz::le32(data + 4);
