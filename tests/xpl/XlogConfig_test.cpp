@@ -86,10 +86,9 @@ TEST(XlogConfig, XplLibInit_StartsCodesThenLoggerAndStopsAtAFailure) {
             if ((xlogSetLevels("*:V") == XERR_SUCCESS) != filled || levelOf(0) != 4 * filled)
                 return "levels on unfilled tables";
             std::string lines;
-            for (const LoggedLine& line : recorder.lines(XLOG_MODULE_XLOG)) {
+            for (const LoggedLine& line : recorder.lines(XLOG_MODULE_XLOG))
                 lines += std::string(1, "EWIDV"[line.level]) + " " + line.file + " " +
                          line.function + ": " + line.text + "\n";
-            }
             for (AndroidLogLine line : capture.lines()) {
                 line.text.erase(std::remove_if(line.text.begin(), line.text.end(), ::isdigit),
                                 line.text.end());
