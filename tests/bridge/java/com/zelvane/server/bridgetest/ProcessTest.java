@@ -79,10 +79,8 @@ class ProcessTest {
         }
     }
 
-    /**
-     * With the property unset, only the lines written whatever the switch says. Then starts again with values that
-     * leave the switch off, `onValue`, then 0: it turns on and stays on; no connection is added.
-     */
+    /** With the property unset, only the lines written whatever the switch says. Then starts again with values that
+     *  leave the switch off, `onValue`, then 0: it turns on and stays on; no connection is added. */
     static void debugSwitch(String onValue) throws Exception {
         Path properties = Path.of(System.getenv("HOSTCALL_PROPERTIES_FILE"));
         Files.writeString(properties, "other.key=1\n");
