@@ -168,10 +168,8 @@ TEST(HcallThreads, GetBufferSizes_DuringConnectAndExchanges_NeverWaits) {
         int host = 0;
         while (reading) hcallGetBufferSizes(&host, nullptr);
     });
-    HcallSession session(scriptWith([](VmsgDeviceScript& s) {
-        s.hostBoundCapacity = 1000;
-        s.guestBoundCapacity = 3000;
-    }));
+    HcallSession session(scriptWith(
+        [](VmsgDeviceScript& s) { s.hostBoundCapacity = 1000, s.guestBoundCapacity = 3000; }));
     reading = false;
     spinner.join();
     ASSERT_TRUE(session.connected);

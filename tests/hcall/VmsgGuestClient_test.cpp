@@ -147,8 +147,7 @@ TEST(VmsgGuestClient, Connect_WhenAStepFails_ReportsAndStaysUnconnected) {
          kHcal, "hcal: mmap() failed: size 8192, errno " + std::to_string(EPERM), 4096},
         {"wrapping length",
          [](VmsgDeviceScript& s) {
-             s.guestBoundOffset = 0xFFFFF000;
-             s.guestBoundCapacity = 0x2000;
+             s.guestBoundOffset = 0xFFFFF000, s.guestBoundCapacity = 0x2000;
          },
          kHcal, layout + "65536, mMaxGuestBoundSize 8192, mGuestBoundOffset 4294963200", 65536},
         {"host-bound beyond mapping",

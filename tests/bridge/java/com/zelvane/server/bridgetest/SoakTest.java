@@ -52,10 +52,7 @@ class SoakTest {
             seq = (seq + 1) % MAX_SEQ;
         }
 
-        Object call(KivHostCallService s) {
-            next();
-            return row.call(s, args);
-        }
+        Object call(KivHostCallService s) { next(); return row.call(s, args); }
     }
 
     final long seed = Long.parseLong(System.getenv().getOrDefault("HOSTCALL_SOAK_SEED", "" + System.nanoTime() % 1000));
