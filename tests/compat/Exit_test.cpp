@@ -159,7 +159,7 @@ TEST(Exit, Exit_WhileTheLibrarysThreadsWork_EndsCleanly) {
              while (started < 2 || added < 1000) std::this_thread::yield();
          }},
     };
-    for (const auto& [state, runs, setUp] : rows) {
+    for (const auto& [state, runs, setUp] : rows)
         for (int i = 0; i < (runs + kRunScale - 1) / kRunScale; ++i) {
             ChildOutcome child = runInChild([&]() -> std::string {
                 gProbe = new Probe();
@@ -170,5 +170,4 @@ TEST(Exit, Exit_WhileTheLibrarysThreadsWork_EndsCleanly) {
             });
             EXPECT_TRUE(child.ok()) << state << ", run " << i << ": " << child.describe();
         }
-    }
 }

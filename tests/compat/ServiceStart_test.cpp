@@ -31,9 +31,7 @@ static std::string startAgain() {
 
 TEST(ServiceStart, Start_AfterAFailedConnectAndWorker_RepeatsOnlyWhatFailed) {
     ChildOutcome child = runInChild([]() -> std::string {
-        VmsgDeviceScript script;
-        script.openErrno = ENOENT;
-        vmsgDeviceConfigure(script);
+        vmsgDeviceConfigure(scriptWith([](VmsgDeviceScript& s) { s.openErrno = ENOENT; }));
         bridge::startService();
         LogRecorder log;
         bridge::startService();

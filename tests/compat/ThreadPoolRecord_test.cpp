@@ -3,7 +3,6 @@
 // past the record meets AddressSanitizer).
 #include <gtest/gtest.h>
 
-#include <atomic>
 #include <csignal>
 #include <cstdarg>
 #include <cstring>
@@ -78,11 +77,9 @@ TEST(ThreadPoolRecord, Init_WhenCountZeroOrNegative_KeepsTasksForThreadEntry) {
             xthrPoolAddTask(&pool, std::function<void()>());
             xthrPoolAddTask(&pool, [&] { events.record("second"); });
             EXPECT_EQ(xthrPoolInit(&pool, count), XERR_SUCCESS);
-            EXPECT_EQ(pool.numThreads, count);
-            EXPECT_EQ(pool.numActive, count);
+            EXPECT_EQ(std::pair(pool.numThreads, pool.numActive), std::pair(count, count));
             xthrPoolFini(&pool);
-            EXPECT_EQ(pool.stop, 1);
-            EXPECT_EQ(pool.tasks.size(), 3u);
+            EXPECT_EQ(std::pair(pool.stop, pool.tasks.size()), std::pair(1, size_t{3}));
             xthrPoolThreadEntry(&pool);
             EXPECT_EQ(events.events(), (std::vector<std::string>{"first", "second"}));
         });

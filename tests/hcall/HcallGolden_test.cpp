@@ -37,7 +37,6 @@ std::vector<Row> readCorpus() {
     return rows;
 }
 
-// Answers every operation with a row's own values.
 struct RowHost : HcallHandler {
     RowHost(const HcallRequest& answer, int32_t result) : mAnswer(answer), mResult(result) {}
     int32_t unhandled(const hcall::OpInfo& op) override {

@@ -33,7 +33,6 @@ void rawReply(VmsgDeviceScript& s, uint8_t first) {
     s.replyMode = VmsgDeviceReplyMode::Raw;
     s.rawReply = {first, 0xFF, 0xFF, 0xFF};
 }
-void noDevice(VmsgDeviceScript& s) { s.openErrno = ENOENT; }
 
 // 715827890 bytes of 'a', then a NUL, in little memory: one MiB mapped over and over.
 [[maybe_unused]] const char* huge() {
@@ -83,7 +82,8 @@ TEST(HcallWire, Call_AgainstTheLimitsAndFailures_IsSentOrRefused) {
       {"launch, reply byte 2", [](VmsgDeviceScript& s) { rawReply(s, 2); }, launch, 1, 1},
       {"launch, reply byte 0", [](VmsgDeviceScript& s) { rawReply(s, 0); }, launch, 0, 1},
       // Chosen: a host that cannot be asked does not veto launches.
-      {"unconnected, the launch query", noDevice, launch, 1, 0,
+      {"unconnected, the launch query", [](VmsgDeviceScript& s) { s.openErrno = ENOENT; }, launch,
+       1, 0,
        "bool VmsgGuestClient::connect(VmsgServiceId): service hcal: open failed for /dev/kivvmsg|"
        "void *VmsgGuestClient::getHostBoundBuffer(uint32_t): service hcal: not connected|"},
 #if !defined(__SANITIZE_THREAD__)  // which would shadow every byte of the 4 GiB of strings
@@ -133,7 +133,6 @@ TEST(HcallThreads, Calls_FromSeveralThreadsAtOnce_NeverOverlapAndEachGetsItsOwnR
     script.delayUs = 20;  // holds each exchange open long enough for a collision
     HcallSession session(script);
     ASSERT_TRUE(session.connected);
-    // Each thread makes a call whose reply no other thread's call gets.
     const std::vector<std::function<bool()>> callers = {
         [] { return hcallOnOrientationChangedRpc(1) == 700; },
         [] { return hcallOnImportFilesCompletedRpc(0, "/sdcard/Download") == 4000; },
@@ -170,10 +169,8 @@ TEST(HcallThreads, GetBufferSizes_DuringConnectAndExchanges_NeverWaits) {
         for (int host = 0, n = 0; reading && n < 100000; ++n, hcallIsAppLaunchAllowedRpc("a"))
             hcallGetBufferSizes(&host, nullptr);
     });
-    HcallSession session(scriptWith([](VmsgDeviceScript& s) {
-        s.hostBoundCapacity = 1000;
-        s.guestBoundCapacity = 3000;
-    }));
+    HcallSession session(scriptWith(
+        [](VmsgDeviceScript& s) { s.hostBoundCapacity = 1000, s.guestBoundCapacity = 3000; }));
     reading = false;
     spinner.join();
     ASSERT_TRUE(session.connected);

@@ -28,9 +28,8 @@ constexpr char kProps[] = "01000000 14000000 08000000 08000000 04000000";
 
 TEST(HcallHost, Parse_OfRequestsBreakingARule_SaysWhich) {
     const struct {
-        const char* request;
-        const char* problem;           // "" for a request that is well formed
-        uint32_t host = 0, guest = 0;  // capacities, 0 for none
+        const char *request, *problem;  // problem "" for a request that is well formed
+        uint32_t host = 0, guest = 0;   // capacities, 0 for none
     } rows[] = {
         {"0C000000 1000", "request of 6 bytes is shorter than the header"},
         {"00000000 08000000", "unknown operation code 0"},
@@ -70,9 +69,7 @@ TEST(HcallHost, Parse_OfRequestsBreakingARule_SaysWhich) {
 TEST(HcallHost, Reply_ShortOrWithStrayBytes_ReadsAsTheGuestReadsIt) {
     const char* launch = "18000000 0E000000 02000000 7000";
     const struct {
-        const char* request;
-        const char* reply;
-        const char* text;
+        const char *request, *reply, *text;
     } rows[] = {
         {kProps, "61626300 00000000",
          "hcallGetPropsRpc(char[8]=\"abc\", 8, i32*) -> !short reply: 8 of 16 bytes"},
@@ -96,7 +93,6 @@ TEST(HcallHost, Reply_ShortOrWithStrayBytes_ReadsAsTheGuestReadsIt) {
     EXPECT_EQ(out, hex("01000000 09000000 00000000")) << "a launch answer is a bool field";
 }
 
-// Records what each overridden entry receives.
 class RecordingHost : public HcallHandler {
   public:
     int32_t hcallOnAppInstalledRpc(std::string_view package, std::string_view activity,
@@ -125,8 +121,7 @@ TEST(HcallHost, Dispatch_HandsEachEntryItsValuesAndRepliesWithItsAnswer) {
     const struct {
         const char* request;
         size_t room;
-        const char* reply;
-        const char* seen;
+        const char *reply, *seen;
     } rows[] = {
         {"0D000000 34000000 02000000 7000 03000000 616300 02000000 6C00 F9FFFFFF 01000000 00 "
          "02000000 6900 02000000 7300 01000000",

@@ -11,8 +11,7 @@
 
 struct AndroidLogLine {
     int priority;
-    std::string tag;
-    std::string text;
+    std::string tag, text;
 };
 
 class AndroidLogCapture {

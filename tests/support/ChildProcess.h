@@ -15,8 +15,7 @@
 
 struct ChildOutcome {
     bool exited = false;  // ended through exit rather than a signal
-    int exitCode = -1;
-    int signal = 0;
+    int exitCode = -1, signal = 0;
     bool hung = false;    // killed by the watchdog
     std::string message;  // what the body returned
 

@@ -34,7 +34,6 @@ class Gate {
     bool open_ = false;
 };
 
-// Names of events in the order in which threads recorded them.
 class EventLog {
   public:
     void record(const std::string& event) {

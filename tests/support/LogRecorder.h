@@ -14,13 +14,10 @@
 #include "xpl/Xlog.h"
 
 struct LoggedLine {
-    int level;
-    int module;
-    std::string file;
-    std::string function;
+    int level, module;
+    std::string file, function;
     int line;
-    std::string format;
-    std::string text;
+    std::string format, text;
 };
 
 class LogRecorder {
@@ -43,7 +40,6 @@ class LogRecorder {
         state().lines.clear();
         state().asked.clear();
     }
-    // Lines printed under `module`, in order.
     std::vector<LoggedLine> lines(int module) const {
         std::lock_guard<std::mutex> lock(state().mutex);
         std::vector<LoggedLine> found;

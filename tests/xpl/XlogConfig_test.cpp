@@ -25,11 +25,10 @@ TEST(XlogConfig, LibInitAndSetLevels_FixTheLevelsThenApplyTokensUntilAMalformedO
     std::string tags;
     for (int m = 0; m < XLOG_NUM_MODULES; ++m)
         tags += g_xlog->modules[m].tag + std::string(levelOf(m) == XLOG_LEVEL_I ? " " : "=D ");
-    EXPECT_EQ(
-        tags,
-        "AGA APN APPC AUD BRIDGE CAM CLD CONF CSM DCRD GCALL GR GRM HCALL HVUTL HST IMAP IMGD "
-        "INP IPC KMM MIM MNS PGA PGAIPC PLR SER UI UTL VMMGR VMSG WERH XCOND XFILE XJSON XLIB "
-        "XLOCK XLOG XMEM=D XMUTEX XPROC XSOCK XSTR XTHR XTIME XTIMER ");
+    EXPECT_EQ(tags,
+              "AGA APN APPC AUD BRIDGE CAM CLD CONF CSM DCRD GCALL GR GRM HCALL HVUTL HST "
+              "IMAP IMGD INP IPC KMM MIM MNS PGA PGAIPC PLR SER UI UTL VMMGR VMSG WERH XCOND "
+              "XFILE XJSON XLIB XLOCK XLOG XMEM=D XMUTEX XPROC XSOCK XSTR XTHR XTIME XTIMER ");
     EXPECT_EQ(xlogShouldLog(-1, XLOG_LEVEL_E) + xlogShouldLog(46, XLOG_LEVEL_E), 0) << "no module";
     // After "*:I XMEM:D": + where the spec is taken, then the levels of HCALL and XMEM.
     // clang-format off
@@ -86,10 +85,9 @@ TEST(XlogConfig, XplLibInit_StartsCodesThenLoggerAndStopsAtAFailure) {
             if ((xlogSetLevels("*:V") == XERR_SUCCESS) != filled || levelOf(0) != 4 * filled)
                 return "levels on unfilled tables";
             std::string lines;
-            for (const LoggedLine& line : recorder.lines(XLOG_MODULE_XLOG)) {
+            for (const LoggedLine& line : recorder.lines(XLOG_MODULE_XLOG))
                 lines += std::string(1, "EWIDV"[line.level]) + " " + line.file + " " +
                          line.function + ": " + line.text + "\n";
-            }
             for (AndroidLogLine line : capture.lines()) {
                 line.text.erase(std::remove_if(line.text.begin(), line.text.end(), ::isdigit),
                                 line.text.end());
@@ -97,8 +95,7 @@ TEST(XlogConfig, XplLibInit_StartsCodesThenLoggerAndStopsAtAFailure) {
             }
             return lines == expected ? "" : "printed\n" + lines;
         });
-        EXPECT_TRUE(outcome.ok()) << std::get<1>(row) << std::get<0>(row) << ": "
-                                  << outcome.describe();
+        EXPECT_TRUE(outcome.ok()) << std::get<1>(row) << std::get<0>(row) << outcome.describe();
     }
 }
 

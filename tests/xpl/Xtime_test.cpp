@@ -55,9 +55,8 @@ TEST(Xtime, BaseConversionAndLogStamp_FollowTheZone) {
             long long before = localWallClock(), now = xtimeNow();
             if (now < before || now > localWallClock()) return "xtimeNow is not the wall clock";
             // While daylight saving is in force the base is read as standard time.
-            for (const auto& [utc, lead] : {std::pair{winter, inWinter}, {summer, inSummer}}) {
+            for (const auto& [utc, lead] : {std::pair{winter, inWinter}, {summer, inSummer}})
                 if (xtimeToUtc(utc + lead) != utc + lead - standard) return "xtimeToUtc";
-            }
             if (xlogLibInit(nullptr, "", "") != XERR_SUCCESS) return "start-up failed";
             char stamp[64];
             // Stamped in the first tenth of a second: the milliseconds show their zeros.

@@ -19,8 +19,6 @@ final class Bridge {
     private static final List<String> LOG = new ArrayList<>();  // "priority|tag|text"
     private static KivHostCallService service;
 
-    private Bridge() {}
-
     static native String takeLogLines();  // each ended by U+0001; the capture forgets them
     static native void configureHost(boolean launchAllowed, int[] codeResults);  // a fresh host; code, result pairs
     static native String exchanges();  // the requests as hex, each ended by a blank
@@ -43,10 +41,7 @@ final class Bridge {
         return service;
     }
 
-    static synchronized KivHostCallService started() {
-        if (service == null) load().native_init();
-        return service;
-    }
+    static synchronized KivHostCallService started() { if (service == null) load().native_init(); return service; }
 
     static String debug(String text) { return "3|" + TAG + "|" + text; }
 
@@ -66,9 +61,7 @@ final class Bridge {
         return new ArrayList<>(lines().stream().skip(from).filter(l -> l.contains("|" + TAG + "|")).toList());
     }
 
-    static List<String> requests() {
-        return new ArrayList<>(Arrays.stream(exchanges().split(" ")).filter(hex -> !hex.isEmpty()).toList());
-    }
+    static List<String> requests() { return Arrays.stream(exchanges().split(" ")).filter(h -> !h.isEmpty()).toList(); }
 
     /** Waits for the sentinel (and its returning line if debugOn); returns what the host got but it. */
     static List<String> drain(KivHostCallService s, boolean debugOn) {

@@ -14,10 +14,8 @@ class MethodsTest {
     static final String BEYOND_BMP = "smile\uD83D\uDE00";
     static final int[] HOST_RESULTS = {28, -5, 14, 13};  // operation code, result; launches refused
 
-    /**
-     * A method: its function's name and parameters as its name string gives them, its operation code, its lines
-     * before and after the strings are converted, how many strings (from the first) it checks, its arguments.
-     */
+    /** A method: its function's name and parameters as its name string gives them, its operation code, its lines
+     *  before and after the strings are converted, how many strings (from the first) it checks, its arguments. */
     record Row(String function, String params, int op, String first, String detail, int checked, Object... args) {
         Method method() {
             // Three Java names lack the final "d" of their function's (native_onImeChange: onImeChanged).

@@ -18,8 +18,7 @@ import org.junit.jupiter.params.provider.ValueSource;
 /** Loading, starting, the debug switch and the exit, each a scenario of {@link #main} in a JVM of its own. */
 class ProcessTest {
     static final String ON_LOAD = "4|" + TAG + "|jint JNI_OnLoad(JavaVM *, void *) called";
-    static final String INIT = "void native_init(JNIEnv *, jobject)";
-    static final String CLASS_PATH = System.getProperty("java.class.path");
+    static final String INIT = "void native_init(JNIEnv *, jobject)", CLASS_PATH = System.getProperty("java.class.path");
 
     /** Runs scenario `args` in a JVM like this one; checks its exit code and that nothing complained. */
     static String run(int exitCode, String classPath, Map<String, String> env, String... args) throws Exception {
@@ -79,10 +78,8 @@ class ProcessTest {
         }
     }
 
-    /**
-     * With the property unset, only the lines written whatever the switch says. Then starts again with values that
-     * leave the switch off, `onValue`, then 0: it turns on and stays on; no connection is added.
-     */
+    /** With the property unset, only the lines written whatever the switch says. Then starts again with values that
+     *  leave the switch off, `onValue`, then 0: it turns on and stays on; no connection is added. */
     static void debugSwitch(String onValue) throws Exception {
         Path properties = Path.of(System.getenv("HOSTCALL_PROPERTIES_FILE"));
         Files.writeString(properties, "other.key=1\n");

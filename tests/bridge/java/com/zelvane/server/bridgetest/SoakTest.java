@@ -13,10 +13,8 @@ import java.util.*;
 import java.util.regex.*;
 import org.junit.jupiter.api.Test;
 
-/**
- * Producers send every kind of event with a value to tag and askers ask the two queries, against a slow host that
- * fails now and then, debug lines off. HOSTCALL_SOAK_EVENTS sizes it, HOSTCALL_SOAK_SEED repeats a run.
- */
+/** Producers send every kind of event with a value to tag and askers ask the two queries, against a slow host that
+ *  fails now and then, debug lines off. HOSTCALL_SOAK_EVENTS sizes it, HOSTCALL_SOAK_SEED repeats a run. */
 class SoakTest {
     static final int PRODUCERS = 4, ASKERS = 2;
     // The native heap in use moves by up to 700 KB: 2 MB finds a leak of 150 bytes an event in the short run.
@@ -54,10 +52,7 @@ class SoakTest {
             seq = (seq + 1) % MAX_SEQ;
         }
 
-        Object call(KivHostCallService s) {
-            next();
-            return row.call(s, args);
-        }
+        Object call(KivHostCallService s) { next(); return row.call(s, args); }
     }
 
     final long seed = Long.parseLong(System.getenv().getOrDefault("HOSTCALL_SOAK_SEED", "" + System.nanoTime() % 1000));
@@ -66,9 +61,7 @@ class SoakTest {
     long delivered, failed;
 
     /** A sender's calls: askers ask once for every eight events a producer sends. */
-    int calls(int id) {
-        return events / PRODUCERS / (id < PRODUCERS ? 1 : 8);
-    }
+    int calls(int id) { return events / PRODUCERS / (id < PRODUCERS ? 1 : 8); }
 
     @Test
     void Soak_WhenEveryKindIsSentWithQueriesAgainstAnUnreliableHost_DeliversEveryEventOnceInOrder() throws Exception {
@@ -133,7 +126,5 @@ class SoakTest {
         for (Sender s : replay) if (s.seq != calls(s.id)) problem(s.id + " got " + s.seq + " of " + calls(s.id));
     }
 
-    synchronized void problem(String what) {
-        if (problems.size() < 20) problems.add(what);
-    }
+    synchronized void problem(String what) { if (problems.size() < 20) problems.add(what); }
 }
