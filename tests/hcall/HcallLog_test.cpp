@@ -5,7 +5,6 @@
 #include <algorithm>
 #include <cstdio>
 #include <cstring>
-#include <regex>
 #include <string>
 
 #include "DeviceSession.h"
@@ -126,9 +125,13 @@ TEST(HcallLog, SignatureTexts_NameTheCataloguedKinds) {
         std::string want = (op.result == hcall::Flag ? "bool " : "xerr_t ") + std::string(op.name);
         for (int i = 0; i < op.numParams; ++i)
             want += (i ? ", " : "(") + std::string(kinds[op.params[i]]);
-        EXPECT_EQ(
-            std::regex_replace(op.signature, std::regex("([( ])(int|xerr_t)(?=[,)])"), "$1i32"),
-            want + (op.numParams ? ")" : "()"));
+        std::string signature = op.signature;  // <regex> trips GCC's warnings under ASan
+        for (const std::string alias : {"int", "xerr_t"})
+            for (size_t at = signature.find('(');
+                 (at = signature.find(alias, at)) != std::string::npos; ++at)
+                if (strchr("( ", signature[at - 1]) && strchr(",)", signature[at + alias.size()]))
+                    signature.replace(at, alias.size(), "i32");
+        EXPECT_EQ(signature, want + (op.numParams ? ")" : "()"));
     }
 }
 
