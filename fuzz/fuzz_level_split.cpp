@@ -32,9 +32,9 @@ std::vector<std::string> referenceSplit(const std::string& s, const std::string&
 // Tokens at blanks, parts at colons; a token applies when it has two parts
 // and the level part starts with one of E W I D V; the first that does not
 // stops the rest with XERR_INVAL.
-xerr_t referenceLevels(const std::string& spec, int* levels) {
+xerr_t referenceLevels(const std::string& text, int* levels) {
     static const char kLetters[] = "EWIDV";
-    for (const std::string& token : referenceSplit(spec, " ")) {
+    for (const std::string& token : referenceSplit(text, " ")) {
         const std::vector<std::string> parts = referenceSplit(token, ":");
         if (parts.size() != 2 || parts[1].empty() || parts[1][0] == '\0') return XERR_INVAL;
         const char* letter = std::strchr(kLetters, parts[1][0]);

@@ -30,9 +30,9 @@ TEST(XlogConfig, LibInitAndSetLevels_FixTheLevelsThenApplyTokensUntilAMalformedO
               "IMAP IMGD INP IPC KMM MIM MNS PGA PGAIPC PLR SER UI UTL VMMGR VMSG WERH XCOND "
               "XFILE XJSON XLIB XLOCK XLOG XMEM=D XMUTEX XPROC XSOCK XSTR XTHR XTIME XTIMER ");
     EXPECT_EQ(xlogShouldLog(-1, XLOG_LEVEL_E) + xlogShouldLog(46, XLOG_LEVEL_E), 0) << "no module";
-    // After "*:I XMEM:D": + where the spec is taken, then the levels of HCALL and XMEM.
+    // After "*:I XMEM:D": + where the level string is taken, then the levels of HCALL and XMEM.
     // clang-format off
-    const struct { const char *spec, *want; } rows[] = {
+    const struct { const char *levels, *want; } rows[] = {
         {"*:D XMEM:Q", "-DD"}, {"*:I ", "-II"},     {"", "-ID"},       {"  HCALL:Verbose", "+VD"},
         {"XMEM:D:V", "-ID"},   {"XMEM::W", "+IW"},  {":D", "-ID"},     {"hcall:V NOSUCH:E", "+ID"},
         {"HCALL=D", "-ID"},    {"HCALL:d", "-ID"},  {"HCALL:W x XMEM:E", "-WD"},
@@ -41,10 +41,10 @@ TEST(XlogConfig, LibInitAndSetLevels_FixTheLevelsThenApplyTokensUntilAMalformedO
     // clang-format on
     for (const auto& row : rows) {
         ASSERT_EQ(xlogSetLevels("*:I XMEM:D"), XERR_SUCCESS);
-        const xerr_t err = xlogSetLevels(row.spec);
+        const xerr_t err = xlogSetLevels(row.levels);
         std::string got = err == XERR_SUCCESS ? "+" : err == XERR_INVAL ? "-" : xerrStr(err);
         for (int m : {XLOG_MODULE_HCALL, XLOG_MODULE_XMEM}) got += "EWIDV"[levelOf(m)];
-        EXPECT_EQ(got, row.want) << row.spec;
+        EXPECT_EQ(got, row.want) << row.levels;
     }
 }
 
