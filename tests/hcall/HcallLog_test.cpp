@@ -95,10 +95,10 @@ TEST(HcallLog, Lines_OfEveryShape_AreExact) {
             EXPECT_EQ(line.function, row.signature);
             EXPECT_GT(line.line, 0);
         }
-        EXPECT_EQ("EWIDV"[lines[0].level] + lines[0].format + lines[0].text,
+        EXPECT_EQ(levelLetter(lines[0].level) + lines[0].format + lines[0].text,
                   "I" + row.format + row.entry);
         if (lines.size() < 2) continue;
-        EXPECT_EQ("EWIDV"[lines[1].level] + lines[1].format,
+        EXPECT_EQ(levelLetter(lines[1].level) + lines[1].format,
                   "D" + (row.exitFormat ? row.exitFormat : "returning [%d] from " + row.format));
         EXPECT_EQ(lines[1].text, "returning [" + std::to_string(row.result) + "] from " +
                                      (row.after.empty() ? row.entry : row.after));

@@ -46,7 +46,7 @@ TEST(VmsgGuestClient, ConnectThenDisconnect_FollowTheDevice) {
     std::vector<LoggedLine> trace = log.lines(XLOG_MODULE_VMSG);
     ASSERT_EQ(trace.size(), 2u);
     for (const LoggedLine& line : trace)
-        EXPECT_EQ("EWIDV"[line.level] + line.file + " " + line.function,
+        EXPECT_EQ(levelLetter(line.level) + line.file + " " + line.function,
                   "ISource/vmsg/guest/VmsgGuest " + std::string(kConnect));
     EXPECT_EQ(trace[0].text, at(trace[0], "called for \n")) << "the name is not yet known";
     EXPECT_EQ(trace[1].text,

@@ -13,6 +13,12 @@
 
 #include "xpl/Xlog.h"
 
+// A level as its letter; '?' for a value outside the five, so a wrong level
+// shows in a comparison rather than reading past the letters.
+inline std::string levelLetter(int level) {
+    return std::string(1, level >= 0 && level < 5 ? "EWIDV"[level] : '?');
+}
+
 struct LoggedLine {
     int level, module;
     std::string file, function;

@@ -40,7 +40,7 @@ TEST(ThreadCreateFailure,
     }
     const std::vector<LoggedLine> lines = recorder.lines(XLOG_MODULE_XTHR);
     ASSERT_EQ(lines.size(), 1u);
-    EXPECT_EQ("EWIDV"[lines[0].level] + lines[0].text,
+    EXPECT_EQ(levelLetter(lines[0].level) + lines[0].text,
               "ExthrPoolInit: started 2 of 4 workers, error 11\n");
     EXPECT_EQ(pool.numThreads * 10 + pool.numActive, 42) << "4 asked for, 2 to wait for";
     // Both started workers are live: each holds a task until the other runs.

@@ -43,7 +43,7 @@ TEST(XlogConfig, LibInitAndSetLevels_FixTheLevelsThenApplyTokensUntilAMalformedO
         ASSERT_EQ(xlogSetLevels("*:I XMEM:D"), XERR_SUCCESS);
         const xerr_t err = xlogSetLevels(row.levels);
         std::string got = err == XERR_SUCCESS ? "+" : err == XERR_INVAL ? "-" : xerrStr(err);
-        for (int m : {XLOG_MODULE_HCALL, XLOG_MODULE_XMEM}) got += "EWIDV"[levelOf(m)];
+        for (int m : {XLOG_MODULE_HCALL, XLOG_MODULE_XMEM}) got += levelLetter(levelOf(m));
         EXPECT_EQ(got, row.want) << row.levels;
     }
 }
@@ -86,8 +86,8 @@ TEST(XlogConfig, XplLibInit_StartsCodesThenLoggerAndStopsAtAFailure) {
                 return "levels on unfilled tables";
             std::string lines;
             for (const LoggedLine& line : recorder.lines(XLOG_MODULE_XLOG))
-                lines += std::string(1, "EWIDV"[line.level]) + " " + line.file + " " +
-                         line.function + ": " + line.text + "\n";
+                lines += levelLetter(line.level) + " " + line.file + " " + line.function + ": " +
+                         line.text + "\n";
             for (AndroidLogLine line : capture.lines()) {
                 line.text.erase(std::remove_if(line.text.begin(), line.text.end(), ::isdigit),
                                 line.text.end());
